@@ -47,10 +47,17 @@ int vconf_set_str(const char *in_key, const char *strval);
 int vconf_notify_key_changed(const char *in_key, vconf_callback_fn cb, void *user_data);
 int vconf_ignore_key_changed(const char *in_key, vconf_callback_fn cb);
 
+// A node's type is VCONF_TYPE_INT when its text is a decimal int, else VCONF_TYPE_STRING.
 const char *vconf_keynode_get_name(keynode_t *keynode);
 int vconf_keynode_get_type(keynode_t *keynode);
+// The value of an int node; VCONF_ERROR for a string node.
 int vconf_keynode_get_int(keynode_t *keynode);
+// The node's text, whatever its type; owned by the node.
 char *vconf_keynode_get_str(keynode_t *keynode);
+
+// Host addition: 1 when key can name a key file (a relative path of plain names, none
+// empty or starting with '.'), else 0.
+int zv_vconf_key_valid(const char *key);
 
 #ifdef __cplusplus
 }

@@ -4,8 +4,10 @@ ZV_DEB_PACKAGES=(
   libefl-all-dev libedje-bin
   libcurl4-openssl-dev libxml2-dev libsqlite3-dev libglib2.0-dev
   libgtest-dev libgmock-dev libcpp-httplib-dev
-  gettext curl xvfb xauth
+  libmicrohttpd-dev libssl-dev openssl
+  gettext curl xvfb xauth matchbox-window-manager
   gstreamer1.0-tools gstreamer1.0-plugins-base gstreamer1.0-plugins-good
+  dbus-daemon iproute2
 )
 
 zv_install_deps() {

@@ -8,9 +8,10 @@
 
 namespace zv_test {
 
-// A temporary folder removed at destruction. With set_env, the process environment of
-// PLATFORM (ZV_RUNTIME_DIR, ZV_HISTORY_DB, ZV_KEY_STORAGE_DIR, ZV_MEDIA_DB, ZV_DLOG_FILE)
-// points into it, ZV_NETWORK is "keys" and ZV_LOCATION is unset.
+// A temporary folder removed at destruction. With set_env, the host environment
+// (ZV_RUNTIME_DIR, ZV_HISTORY_DB, ZV_KEY_STORAGE_DIR, ZV_MEDIA_DB) points into it,
+// ZV_NETWORK is "keys" and ZV_LOCATION is unset. The log file is opened once per process,
+// so ZV_DLOG_FILE is left to the test program.
 class TempDir {
 public:
     explicit TempDir(bool set_env = true);

@@ -1,0 +1,331 @@
+// The service's process entry: the launch extras read into the batch settings, the window
+// stack built at create and taken down at terminate, one pair of key handlers per launch,
+// and the real program as a running instance that takes later launches and ends on SIGTERM.
+#include <Ecore.h>
+#include <Ecore_Input.h>
+#include <Elementary.h>
+#include <app.h>
+#include <efl_extension.h>
+#include <glib.h>
+#include <gtest/gtest.h>
+#include <stdlib.h>
+#include <string.h>
+#include <uxt.h>
+
+#include <memory>
+#include <string>
+
+#include "zv-app-test-util.h"
+#include "zv-ext-db.h"
+#include "zv-log.h"
+#include "zv-upload-ctrl.h"
+#include "zv-upload-main.h"
+#include "zv-upload-view.h"
+
+// The entry's own functions are file-local: the test compiles the file in.
+#define main zv_upload_main_entry
+#include "../../upload-svc/src/zv-upload-main.cpp"
+#undef main
+
+using namespace zv_test;
+
+namespace {
+
+// Every log line of this process and of the programs it starts goes to one file.
+struct ProcessLog {
+    ProcessLog()
+    {
+        char tmpl[] = "/tmp/zv-main-test-log-XXXXXX";
+        int fd = mkstemp(tmpl);
+        if (fd >= 0)
+            close(fd);
+        path = tmpl;
+        setenv("ZV_DLOG_FILE", path.c_str(), 1);
+    }
+    ~ProcessLog() { unlink(path.c_str()); }
+    // The lines of process pid written since mark().
+    std::string lines_of(pid_t pid) const
+    {
+        std::string all = read_file(path).substr(mark_);
+        std::string tag = "(" + std::to_string(pid) + "): ";
+        std::string out;
+        size_t pos = 0;
+        while (pos < all.size()) {
+            size_t end = all.find('\n', pos);
+            if (end == std::string::npos)
+                end = all.size();
+            std::string line = all.substr(pos, end - pos);
+            if (line.find(tag) != std::string::npos)
+                out += line + "\n";
+            pos = end + 1;
+        }
+        return out;
+    }
+    bool logged(const std::string &text, pid_t pid = getpid()) const
+    {
+        return lines_of(pid).find(text) != std::string::npos;
+    }
+    void mark() { mark_ = read_file(path).size(); }
+
+    std::string path;
+    size_t mark_ = 0;
+};
+
+ProcessLog process_log;
+
+using Extras = std::vector<std::pair<const char *, const char *>>;
+
+app_control_h make_request(const Extras &extras)
+{
+    app_control_h h = nullptr;
+    app_control_create(&h);
+    for (const auto &kv : extras)
+        app_control_add_extra_data(h, kv.first, kv.second);
+    return h;
+}
+
+std::string str(const char *s)
+{
+    return s ? s : "(null)";
+}
+
+} // namespace
+
+TEST(UploadMainExtras, ReadingRules)
+{
+    const Extras full = {{"ZV_DATA_ACCESS_TOKEN", "tok"}, {"ZV_DATA_CATEGORY", "Music"},
+                         {"ZV_DATA_DESCRIPTION", "desc"}, {"ZV_DATA_TAG", "a,b"},
+                         {"ZV_DATA_ACCESS_TYPE", "2"}};
+    const struct {
+        const char *what;
+        Extras extras;
+        bool ok;
+        const char *message; // logged on failure
+        const char *token, *category, *description, *tag;
+        int access_type;
+        bool use_location;
+    } cases[] = {
+        {"all five", full, true, nullptr, "tok", "Music", "desc", "a,b", 2, false},
+        {"optional ones absent",
+         {{"ZV_DATA_ACCESS_TOKEN", "t2"},
+          {"ZV_DATA_CATEGORY", "People"},
+          {"ZV_DATA_ACCESS_TYPE", "1"}},
+         true,
+         nullptr,
+         "t2",
+         "People",
+         nullptr,
+         nullptr,
+         1,
+         false},
+        {"access type not a number",
+         {{"ZV_DATA_ACCESS_TOKEN", "t3"},
+          {"ZV_DATA_CATEGORY", "Pets"},
+          {"ZV_DATA_ACCESS_TYPE", "x"}},
+         true,
+         nullptr,
+         "t3",
+         "Pets",
+         nullptr,
+         nullptr,
+         0,
+         false},
+        {"access type missing keeps the batch",
+         {{"ZV_DATA_ACCESS_TOKEN", "t4"}, {"ZV_DATA_CATEGORY", "Cars"}},
+         false,
+         "app_control_get_extra_data error : -126",
+         "t3",
+         "Pets",
+         nullptr,
+         nullptr,
+         0,
+         false},
+        {"token missing keeps the batch",
+         {{"ZV_DATA_CATEGORY", "Cars"}, {"ZV_DATA_ACCESS_TYPE", "1"}},
+         false,
+         "app_control_get_extra_data error: -126",
+         "t3",
+         "Pets",
+         nullptr,
+         nullptr,
+         0,
+         false},
+        {"category missing keeps the batch",
+         {{"ZV_DATA_ACCESS_TOKEN", "t5"}, {"ZV_DATA_ACCESS_TYPE", "1"}},
+         false,
+         "app_control_get_extra_data error : -126",
+         "t3",
+         "Pets",
+         nullptr,
+         nullptr,
+         0,
+         false},
+        {"location on",
+         {{"ZV_DATA_ACCESS_TOKEN", "t6"},
+          {"ZV_DATA_CATEGORY", "Pets"},
+          {"ZV_DATA_ACCESS_TYPE", "0"},
+          {"ZV_DATA_USE_LOCATION", "true"}},
+         true,
+         nullptr,
+         "t6",
+         "Pets",
+         nullptr,
+         nullptr,
+         0,
+         true},
+        {"location 0 is off",
+         {{"ZV_DATA_ACCESS_TOKEN", "t7"},
+          {"ZV_DATA_CATEGORY", "Pets"},
+          {"ZV_DATA_ACCESS_TYPE", "0"},
+          {"ZV_DATA_USE_LOCATION", "0"}},
+         true,
+         nullptr,
+         "t7",
+         "Pets",
+         nullptr,
+         nullptr,
+         0,
+         false},
+    };
+    AppData ad{};
+    for (const auto &c : cases) {
+        app_control_h h = make_request(c.extras);
+        process_log.mark();
+        EXPECT_EQ(_zv_upload_main_get_app_control_info(h, &ad), c.ok) << c.what;
+        app_control_destroy(h);
+        if (c.message) {
+            EXPECT_TRUE(process_log.logged(c.message)) << c.what << "\n"
+                                                       << process_log.lines_of(getpid());
+        }
+        EXPECT_EQ(str(ad.access_token), str(c.token)) << c.what;
+        EXPECT_EQ(str(ad.category), str(c.category)) << c.what;
+        EXPECT_EQ(str(ad.description), str(c.description)) << c.what;
+        EXPECT_EQ(str(ad.tag), str(c.tag)) << c.what;
+        EXPECT_EQ(ad.access_type, c.access_type) << c.what;
+        EXPECT_EQ(ad.use_location, c.use_location) << c.what;
+    }
+    free(ad.access_token);
+    free(ad.category);
+}
+
+class UploadMainAppTest : public ::testing::Test {
+protected:
+    TempDir tmp_;
+};
+
+TEST_F(UploadMainAppTest, CreateBuildsTheWindowStackAndTerminateTakesItDown)
+{
+    AppData ad{};
+    process_log.mark();
+    ASSERT_TRUE(_app_create(&ad));
+    ASSERT_NE(ad.win, nullptr);
+    EXPECT_STREQ(elm_win_title_get(ad.win), "zuvo-upload-svc");
+    EXPECT_EQ(elm_object_content_get(ad.conform), ad.layout);
+    EXPECT_EQ(elm_object_part_content_get(ad.layout, "elm.swallow.content"), ad.navi);
+    EXPECT_NE(ad.bg, nullptr);
+    EXPECT_NE(ad.color_table, nullptr);
+    EXPECT_NE(ad.font_table, nullptr);
+    EXPECT_NE(ad.exit, nullptr); // the controller started
+    // The naviframe carries the view's back and more callbacks.
+    EXPECT_EQ(
+        eext_object_event_callback_del(ad.navi, EEXT_CALLBACK_MORE, zv_upload_view_morekey_cb),
+        &ad);
+    eext_object_event_callback_add(ad.navi, EEXT_CALLBACK_MORE, zv_upload_view_morekey_cb, &ad);
+
+    // Two launch requests leave one pair of key handlers: a key event reaches the view once,
+    // and with the current pair gone it reaches the view no more.
+    const Extras extras = {{"ZV_DATA_ACCESS_TOKEN", "t"}, {"ZV_DATA_CATEGORY", "Music"},
+                           {"ZV_DATA_ACCESS_TYPE", "1"}};
+    for (int i = 0; i < 2; i++) {
+        app_control_h h = make_request(extras);
+        _app_control(h, &ad);
+        app_control_destroy(h);
+    }
+    ASSERT_NE(ad.key_down_handler, nullptr);
+    auto press = [] {
+        auto *ev = static_cast<Ecore_Event_Key *>(calloc(1, sizeof(Ecore_Event_Key)));
+        ev->keyname = ev->key = "Return";
+        ev->string = "";
+        process_log.mark();
+        ecore_event_add(ECORE_EVENT_KEY_DOWN, ev, [](void *, void *e) { free(e); }, nullptr);
+        wait_for([] { return process_log.logged("zv_upload_view_event_key_down_cb"); }, 2000);
+    };
+    press();
+    EXPECT_TRUE(process_log.logged("zv_upload_view_event_key_down_cb"));
+    ecore_event_handler_del(ad.key_down_handler);
+    ad.key_down_handler = nullptr;
+    press();
+    EXPECT_FALSE(process_log.logged("zv_upload_view_event_key_down_cb"));
+
+    _app_terminate(&ad);
+    EXPECT_EQ(ad.win, nullptr);
+    EXPECT_EQ(ad.color_table, nullptr);
+    EXPECT_EQ(ad.font_table, nullptr);
+    EXPECT_EQ(ad.key_up_handler, nullptr);
+    free(ad.access_token);
+    free(ad.category);
+}
+
+TEST_F(UploadMainAppTest, MissingTablesAreLoggedAndCreateGoesOn)
+{
+    const char *env = getenv("ZV_RES_DIR");
+    std::string saved = env ? env : "";
+    setenv("ZV_RES_DIR", tmp_.path().c_str(), 1);
+    AppData ad{};
+    process_log.mark();
+    EXPECT_TRUE(_app_create(&ad));
+    if (env)
+        setenv("ZV_RES_DIR", saved.c_str(), 1);
+    else
+        unsetenv("ZV_RES_DIR");
+    EXPECT_TRUE(process_log.logged("[ERR] color table create fail"));
+    EXPECT_TRUE(process_log.logged("[ERR] font table create fail"));
+    EXPECT_EQ(ad.color_table, nullptr);
+    _app_terminate(&ad);
+}
+
+TEST(UploadMainCallbacks, NullArgumentsAreRefused)
+{
+    process_log.mark();
+    EXPECT_FALSE(_app_create(nullptr));
+    EXPECT_TRUE(process_log.logged("userp is NULL"));
+    AppData ad{};
+    _app_control(nullptr, &ad);
+    EXPECT_TRUE(process_log.logged("service handle is NULL"));
+    app_control_h h = make_request({});
+    _app_control(h, &ad);
+    app_control_destroy(h);
+    EXPECT_TRUE(process_log.logged("win is NULL"));
+    _zv_upload_win_rot_changed_cb(nullptr, nullptr, nullptr);
+    EXPECT_TRUE(process_log.logged("obj is NULL"));
+    _app_pause(&ad);
+    EXPECT_TRUE(ad.is_paused);
+    _app_resume(&ad);
+    EXPECT_FALSE(ad.is_paused);
+}
+
+TEST(UploadMainProgram, RunsAsInstanceTakesLaterLaunchesAndEndsOnSigterm)
+{
+    TempDir tmp;
+    const std::string svc = bin_path("zuvo-upload-svc");
+    process_log.mark();
+    pid_t pid = spawn_program({svc, "--extra", "ZV_DATA_ACCESS_TOKEN=t", "--extra",
+                               "ZV_DATA_CATEGORY=Music", "--extra", "ZV_DATA_ACCESS_TYPE=0"});
+    ASSERT_GT(pid, 0);
+    ASSERT_TRUE(wait_for([&] { return process_log.logged("_app_resume", pid); }, 30000))
+        << process_log.lines_of(pid);
+
+    // A later launch without the access type is handed over; the instance keeps running.
+    std::string out;
+    EXPECT_EQ(run_program(
+                  {svc, "--extra", "ZV_DATA_ACCESS_TOKEN=t2", "--extra", "ZV_DATA_CATEGORY=Pets"}),
+              0);
+    EXPECT_TRUE(wait_for([&] { return process_log.logged("get bundle value fail", pid); }, 10000));
+    EXPECT_TRUE(process_log.logged("app_control_get_extra_data error : -126", pid));
+    EXPECT_EQ(run_program({svc, "--extra", "broken"}), 2);
+
+    kill(pid, SIGTERM);
+    EXPECT_EQ(wait_program(pid), 0);
+    EXPECT_TRUE(process_log.logged("_app_terminate", pid));
+    EXPECT_TRUE(process_log.logged("ui_app_main() loop", pid));
+}
