@@ -1,0 +1,304 @@
+// Tests of the companion client program, run from the build against a fresh history, media
+// database and runtime folder; its launch requests go to a listener standing in for the
+// running service.
+#include <app.h>
+#include <gtest/gtest.h>
+#include <media_content.h>
+#include <poll.h>
+#include <string.h>
+#include <sys/socket.h>
+#include <sys/stat.h>
+#include <sys/un.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <future>
+#include <map>
+#include <sstream>
+#include <string>
+#include <vector>
+
+#include "zv-ext-db.h"
+#include "zv-test-util.h"
+
+namespace
+{
+
+using Extras = std::map<std::string, std::string>;
+
+class ZuvoClientTest : public ::testing::Test
+{
+  protected:
+    void SetUp() override
+    {
+        char cwd[4096];
+        ASSERT_NE(getcwd(cwd, sizeof cwd), nullptr);
+        old_cwd_ = cwd;
+        ASSERT_EQ(chdir(tmp_.path().c_str()), 0);
+    }
+    void TearDown() override
+    {
+        zv_ext_db_close();
+        EXPECT_EQ(chdir(old_cwd_.c_str()), 0);
+    }
+
+    // Runs the client; its standard error goes to a file read into *err.
+    int client(const std::vector<std::string> &args, std::string *out = nullptr,
+               std::string *err = nullptr)
+    {
+        std::string err_file = tmp_.file("stderr");
+        std::vector<std::string> argv = {"/bin/sh", "-c", "exec \"$0\" \"$@\" 2>'" + err_file + "'",
+                                         zv_test::bin_path("zuvo-client")};
+        argv.insert(argv.end(), args.begin(), args.end());
+        int status = zv_test::run_program(argv, "", out);
+        if (err)
+            *err = zv_test::read_file(err_file);
+        return status;
+    }
+
+    // The list's rows by id, each split into its columns (no blanks in the test's values).
+    std::map<std::string, std::vector<std::string>> listed()
+    {
+        std::string out;
+        EXPECT_EQ(client({"list"}, &out), 0);
+        std::map<std::string, std::vector<std::string>> rows;
+        std::istringstream lines(out);
+        std::string line;
+        std::getline(lines, line);
+        EXPECT_EQ(line.rfind("ID  ", 0), 0u) << line;
+        while (std::getline(lines, line)) {
+            std::istringstream cols(line);
+            std::vector<std::string> row;
+            for (std::string col; cols >> col;)
+                row.push_back(col);
+            rows[row.at(0)] = row;
+        }
+        return rows;
+    }
+
+    int history_rows()
+    {
+        EXPECT_EQ(zv_ext_db_open(), 1);
+        int n = zv_ext_db_get_full_count();
+        zv_ext_db_close();
+        return n;
+    }
+
+    zv_test::TempDir tmp_;
+    std::string old_cwd_;
+};
+
+TEST_F(ZuvoClientTest, AddListRemoveRoundTrip)
+{
+    ASSERT_TRUE(zv_test::write_file(tmp_.file("clip.one.mp4"), std::string(10, 'v')));
+    ASSERT_TRUE(zv_test::write_file(tmp_.file("b.mov"), "abc"));
+    std::string out;
+    ASSERT_EQ(client({"add", "clip.one.mp4", "b.mov", "--user", "me"}, &out), 0);
+    EXPECT_EQ(out, "1\t" + tmp_.file("clip.one.mp4") + "\n2\t" + tmp_.file("b.mov") + "\n");
+    ASSERT_EQ(client({"add", "--title=Take", "b.mov"}, &out), 0);
+    EXPECT_EQ(out, "3\t" + tmp_.file("b.mov") + "\n");
+
+    ASSERT_EQ(zv_ext_db_open(), 1);
+    GList *list = nullptr;
+    ASSERT_EQ(zv_ext_db_load_full_item_list(&list), 1);
+    ASSERT_EQ(g_list_length(list), 3u);
+    auto *first = static_cast<DbItem *>(list->data);
+    auto *second = static_cast<DbItem *>(list->next->data);
+    EXPECT_EQ(first->historyid, 1);
+    EXPECT_STREQ(first->title, "clip.one");
+    EXPECT_STREQ(first->filename, tmp_.file("clip.one.mp4").c_str());
+    EXPECT_EQ(first->filesize, 10);
+    EXPECT_STREQ(first->userid, "me");
+    EXPECT_EQ(first->status, ZV_UPLOAD_STATUS_READY);
+    EXPECT_EQ(first->url, nullptr);
+    EXPECT_LT(first->date, second->date);
+    zv_ext_db_free_item_list(list);
+    DbItem progress{};
+    progress.historyid = 2;
+    progress.percent = 40;
+    progress.status = ZV_UPLOAD_STATUS_UPLOADING;
+    ASSERT_EQ(zv_ext_db_update_item(&progress), 1);
+    zv_ext_db_close();
+
+    auto rows = listed();
+    ASSERT_EQ(rows.size(), 3u);
+    EXPECT_EQ(rows["1"], (std::vector<std::string>{"1", "clip.one", "READY", "0%", "10",
+                                                   tmp_.file("clip.one.mp4")}));
+    EXPECT_EQ(rows["2"][2], "UPLOADING");
+    EXPECT_EQ(rows["2"][3], "40%");
+    EXPECT_EQ(rows["3"][1], "Take");
+
+    // Registered in the media database under its file name.
+    ASSERT_EQ(media_content_connect(), MEDIA_CONTENT_ERROR_NONE);
+    filter_h filter = nullptr;
+    ASSERT_EQ(media_filter_create(&filter), MEDIA_CONTENT_ERROR_NONE);
+    std::string cond = "MEDIA_TYPE = 1 and MEDIA_PATH= \"" + tmp_.file("b.mov") + "\"";
+    ASSERT_EQ(media_filter_set_condition(filter, cond.c_str(), MEDIA_CONTENT_COLLATE_DEFAULT),
+              MEDIA_CONTENT_ERROR_NONE);
+    std::string name;
+    media_info_foreach_media_from_db(
+        filter,
+        [](media_info_h media, void *data) {
+            char *n = nullptr;
+            media_info_get_display_name(media, &n);
+            *static_cast<std::string *>(data) = n ? n : "";
+            free(n);
+            return false;
+        },
+        &name);
+    media_filter_destroy(filter);
+    media_content_disconnect();
+    EXPECT_EQ(name, "b.mov");
+
+    EXPECT_EQ(client({"remove", "1"}), 0);
+    EXPECT_EQ(client({"remove", "1"}), 2);
+    rows = listed();
+    EXPECT_EQ(rows.size(), 2u);
+    EXPECT_EQ(rows.count("1"), 0u);
+}
+
+TEST_F(ZuvoClientTest, WrongCallsExitTwoAndRecordNothing)
+{
+    ASSERT_TRUE(zv_test::write_file(tmp_.file("good.mp4"), "video"));
+    ASSERT_EQ(mkdir(tmp_.file("folder").c_str(), 0700), 0);
+    ASSERT_EQ(mkfifo(tmp_.file("fifo").c_str(), 0600), 0);
+    ASSERT_TRUE(zv_test::write_file(tmp_.file("big.mp4"), ""));
+    ASSERT_EQ(truncate(tmp_.file("big.mp4").c_str(), 2147483648LL), 0); // sparse
+    std::vector<std::vector<std::string>> calls = {
+        {},
+        {"frob"},
+        {"add"},
+        {"add", "good.mp4", "--title"},
+        {"add", "--bogus", "good.mp4"},
+        {"add", "good.mp4", "missing.mp4"},
+        {"add", "good.mp4", "folder"},
+        {"add", "good.mp4", "fifo"},
+        {"add", "good.mp4", "big.mp4"},
+        {"add", "--title", "a", "--title", "b", "good.mp4"},
+        {"list", "extra"},
+        {"remove"},
+        {"remove", "12x"},
+        {"remove", "7"},
+        {"launch", "--category", "c"},
+        {"launch", "--token", "t", "--category", "c", "--privacy", "secret"},
+        {"launch", "--token", "t", "--category", "c", "stray"},
+    };
+    if (geteuid() != 0) {
+        ASSERT_TRUE(zv_test::write_file(tmp_.file("locked.mp4"), "x"));
+        ASSERT_EQ(chmod(tmp_.file("locked.mp4").c_str(), 0), 0);
+        calls.push_back({"add", "good.mp4", "locked.mp4"});
+    }
+    for (const auto &call : calls) {
+        std::string joined;
+        for (const auto &a : call)
+            joined += a + " ";
+        SCOPED_TRACE(joined);
+        std::string out, err;
+        EXPECT_EQ(client(call, &out, &err), 2);
+        EXPECT_EQ(out, "");
+        EXPECT_EQ(err.rfind("zuvo-client: ", 0), 0u) << err;
+        EXPECT_EQ(std::count(err.begin(), err.end(), '\n'), 1) << err;
+    }
+    EXPECT_EQ(history_rows(), 0);
+
+    std::string out;
+    EXPECT_EQ(client({"add", "--help"}, &out), 0);
+    EXPECT_EQ(out.rfind("Usage: zuvo-client", 0), 0u);
+}
+
+// Accepts one launch message on the service's socket, answers that it was taken and
+// returns its extras (empty when none came within the bound).
+Extras serve_one_launch(int listen_fd)
+{
+    Extras extras;
+    struct pollfd pfd = {listen_fd, POLLIN, 0};
+    if (poll(&pfd, 1, 30000) <= 0)
+        return extras;
+    int conn = accept(listen_fd, nullptr, nullptr);
+    if (conn < 0)
+        return extras;
+    struct timeval tv = {10, 0};
+    setsockopt(conn, SOL_SOCKET, SO_RCVTIMEO, &tv, sizeof tv);
+    std::string msg;
+    char buf[4096];
+    size_t want = ZV_APP_LAUNCH_HEADER_SIZE;
+    while (msg.size() < want) {
+        ssize_t n = recv(conn, buf, sizeof buf, 0);
+        if (n <= 0)
+            break;
+        msg.append(buf, (size_t)n);
+        if (msg.size() >= ZV_APP_LAUNCH_HEADER_SIZE)
+            want = ZV_APP_LAUNCH_HEADER_SIZE +
+                   ((size_t)(unsigned char)msg[4] | (size_t)(unsigned char)msg[5] << 8 |
+                    (size_t)(unsigned char)msg[6] << 16 | (size_t)(unsigned char)msg[7] << 24);
+    }
+    app_control_h request = nullptr;
+    if (zv_app_launch_message_parse(reinterpret_cast<const unsigned char *>(msg.data()), msg.size(),
+                                    &request) == APP_CONTROL_ERROR_NONE) {
+        app_control_foreach_extra_data(
+            request,
+            [](app_control_h ac, const char *key, void *data) {
+                char *value = nullptr;
+                app_control_get_extra_data(ac, key, &value);
+                (*static_cast<Extras *>(data))[key] = value ? value : "";
+                free(value);
+                return true;
+            },
+            &extras);
+        app_control_destroy(request);
+    }
+    char taken = 'A';
+    if (send(conn, &taken, 1, MSG_NOSIGNAL) != 1)
+        extras.clear();
+    close(conn);
+    return extras;
+}
+
+TEST_F(ZuvoClientTest, LaunchSendsTheBatchExtras)
+{
+    struct Case {
+        std::vector<std::string> args;
+        Extras expected;
+    };
+    const Case cases[] = {
+        {{"--token", "tok", "--category", "People"},
+         {{"ZV_DATA_ACCESS_TOKEN", "tok"},
+          {"ZV_DATA_CATEGORY", "People"},
+          {"ZV_DATA_ACCESS_TYPE", "0"}}},
+        {{"--category=Music", "--token", "t2", "--description", "two words", "--tag", "a,b",
+          "--privacy", "private", "--location"},
+         {{"ZV_DATA_ACCESS_TOKEN", "t2"},
+          {"ZV_DATA_CATEGORY", "Music"},
+          {"ZV_DATA_DESCRIPTION", "two words"},
+          {"ZV_DATA_TAG", "a,b"},
+          {"ZV_DATA_ACCESS_TYPE", "2"},
+          {"ZV_DATA_USE_LOCATION", "1"}}},
+        {{"--token", "t", "--category", "c", "--privacy", "unlisted"},
+         {{"ZV_DATA_ACCESS_TOKEN", "t"}, {"ZV_DATA_CATEGORY", "c"}, {"ZV_DATA_ACCESS_TYPE", "1"}}},
+    };
+
+    std::string run_dir = tmp_.file("run");
+    ASSERT_EQ(mkdir(run_dir.c_str(), 0700), 0);
+    std::string sock_path = run_dir + "/zuvo-upload-svc.sock";
+    int fd = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
+    ASSERT_GE(fd, 0);
+    struct sockaddr_un addr = {};
+    addr.sun_family = AF_UNIX;
+    ASSERT_LT(sock_path.size(), sizeof addr.sun_path);
+    memcpy(addr.sun_path, sock_path.c_str(), sock_path.size() + 1);
+    ASSERT_EQ(bind(fd, (struct sockaddr *)&addr, sizeof addr), 0);
+    ASSERT_EQ(listen(fd, 4), 0);
+
+    for (const Case &c : cases) {
+        SCOPED_TRACE(c.args[1]);
+        auto served = std::async(std::launch::async, serve_one_launch, fd);
+        std::vector<std::string> args = {"launch"};
+        args.insert(args.end(), c.args.begin(), c.args.end());
+        std::string err;
+        EXPECT_EQ(client(args, nullptr, &err), 0) << err;
+        EXPECT_EQ(served.get(), c.expected);
+    }
+    close(fd);
+}
+
+} // namespace
