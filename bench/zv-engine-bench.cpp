@@ -1,0 +1,615 @@
+// Transfer engine benchmark against a loopback server: upload throughput and CPU per GiB
+// next to `curl -T`, the worker's CPU while its only transfer is paused, the delay from
+// queueing on an idle engine to the first byte at the server, and resident memory during a
+// large upload and over many requests. Prints each figure with its target.
+//
+//   zv-engine-bench [--size-mib N] [--rounds N] [--requests N] [--devserver PATH]
+//   zv-engine-bench --sink          (the sink server: prints its port, reads and discards)
+//
+// The server is zuvo-devserver when --devserver names it (an upload address is made for each
+// upload with the metadata POST), else the sink of this program, run as a child process so
+// that its CPU is not counted as the engine's.
+#include <arpa/inet.h>
+#include <fcntl.h>
+#include <netinet/in.h>
+#include <poll.h>
+#include <signal.h>
+#include <stdio.h>
+#include <stdlib.h>
+#include <string.h>
+#include <sys/resource.h>
+#include <sys/socket.h>
+#include <sys/stat.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <atomic>
+#include <chrono>
+#include <condition_variable>
+#include <mutex>
+#include <string>
+#include <thread>
+#include <vector>
+
+#include "zv-plugin-curl.h"
+
+namespace
+{
+
+using Clock = std::chrono::steady_clock;
+
+double seconds_since(Clock::time_point t)
+{
+    return std::chrono::duration<double>(Clock::now() - t).count();
+}
+
+double cpu_seconds(const rusage &ru)
+{
+    return ru.ru_utime.tv_sec + ru.ru_utime.tv_usec / 1e6 + ru.ru_stime.tv_sec +
+           ru.ru_stime.tv_usec / 1e6;
+}
+
+double self_cpu()
+{
+    rusage ru;
+    getrusage(RUSAGE_SELF, &ru);
+    return cpu_seconds(ru);
+}
+
+long rss_kib()
+{
+    FILE *f = fopen("/proc/self/status", "r");
+    if (!f)
+        return -1;
+    char line[256];
+    long kib = -1;
+    while (fgets(line, sizeof line, f)) {
+        if (strncmp(line, "VmRSS:", 6) == 0) {
+            kib = atol(line + 6);
+            break;
+        }
+    }
+    fclose(f);
+    return kib;
+}
+
+// ---- the sink server (child process) ----
+
+void sink_connection(int fd)
+{
+    std::vector<char> buf(1 << 20);
+    std::string head;
+    for (;;) {
+        head.clear();
+        size_t end;
+        std::string rest;
+        while ((end = head.find("\r\n\r\n")) == std::string::npos) {
+            ssize_t n = recv(fd, buf.data(), 4096, 0);
+            if (n <= 0) {
+                close(fd);
+                return;
+            }
+            head.append(buf.data(), static_cast<size_t>(n));
+        }
+        rest = head.substr(end + 4);
+        head.resize(end + 4);
+        std::string lower(head);
+        for (char &c : lower)
+            c = static_cast<char>(tolower(static_cast<unsigned char>(c)));
+        long long left = 0;
+        size_t at = lower.find("\r\ncontent-length:");
+        if (at != std::string::npos)
+            left = atoll(lower.c_str() + at + 17);
+        if (lower.find("\r\nexpect: 100-continue") != std::string::npos)
+            send(fd, "HTTP/1.1 100 Continue\r\n\r\n", 25, MSG_NOSIGNAL);
+        left -= static_cast<long long>(rest.size());
+        while (left > 0) {
+            ssize_t n = recv(fd, buf.data(), std::min<long long>(left, buf.size()), 0);
+            if (n <= 0) {
+                close(fd);
+                return;
+            }
+            left -= n;
+        }
+        const char *answer = "HTTP/1.1 201 Created\r\nETag: \"bench\"\r\nContent-Length: 0\r\n\r\n";
+        send(fd, answer, strlen(answer), MSG_NOSIGNAL);
+    }
+}
+
+int run_sink()
+{
+    int fd = socket(AF_INET, SOCK_STREAM, 0);
+    sockaddr_in addr{};
+    addr.sin_family = AF_INET;
+    addr.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
+    socklen_t len = sizeof addr;
+    if (bind(fd, reinterpret_cast<sockaddr *>(&addr), len) != 0 || listen(fd, 64) != 0 ||
+        getsockname(fd, reinterpret_cast<sockaddr *>(&addr), &len) != 0)
+        return 1;
+    printf("%d\n", ntohs(addr.sin_port));
+    fflush(stdout);
+    // Ends when its parent goes away, whatever happens to the parent.
+    for (;;) {
+        if (getppid() == 1)
+            return 0;
+        pollfd pfd{fd, POLLIN, 0};
+        if (poll(&pfd, 1, 1000) <= 0)
+            continue;
+        int conn = accept(fd, nullptr, nullptr);
+        if (conn >= 0)
+            std::thread(sink_connection, conn).detach();
+    }
+}
+
+// Starts argv as a child whose first line of output is its port.
+pid_t spawn_server(const std::vector<std::string> &argv, int *port)
+{
+    int out[2];
+    if (pipe(out) != 0)
+        return -1;
+    pid_t pid = fork();
+    if (pid == 0) {
+        dup2(out[1], STDOUT_FILENO);
+        close(out[0]);
+        close(out[1]);
+        std::vector<char *> args;
+        for (const std::string &a : argv)
+            args.push_back(const_cast<char *>(a.c_str()));
+        args.push_back(nullptr);
+        execv(args[0], args.data());
+        _exit(127);
+    }
+    close(out[1]);
+    std::string line;
+    char c;
+    while (read(out[0], &c, 1) == 1 && c != '\n')
+        line += c;
+    close(out[0]);
+    // The port is the last number on the line.
+    size_t digits = line.find_last_not_of("0123456789");
+    *port = atoi(line.c_str() + (digits == std::string::npos ? 0 : digits + 1));
+    return pid;
+}
+
+// ---- engine requests ----
+
+struct Waiter {
+    std::mutex m;
+    std::condition_variable cv;
+    bool done = false;
+    long http_code = -2;
+    std::string header;
+    std::atomic<int> reads{0};
+
+    void reset()
+    {
+        std::lock_guard<std::mutex> lock(m);
+        done = false;
+        http_code = -2;
+        header.clear();
+        reads = 0;
+    }
+    bool wait(double timeout_s)
+    {
+        std::unique_lock<std::mutex> lock(m);
+        return cv.wait_for(lock, std::chrono::duration<double>(timeout_s), [this] { return done; });
+    }
+};
+
+void on_answer(int, TransferResponse *resp, void *user_data)
+{
+    Waiter *w = static_cast<Waiter *>(user_data);
+    std::lock_guard<std::mutex> lock(w->m);
+    w->done = true;
+    w->http_code = resp->http_code;
+    if (resp->header_data)
+        w->header = resp->header_data;
+    w->cv.notify_all();
+}
+
+void on_progress(int, void *user_data, int, int)
+{
+    static_cast<Waiter *>(user_data)->reads++;
+}
+
+TransferItem *new_item(Waiter *w, int method, const std::string &url)
+{
+    TransferItem *item = nullptr;
+    zv_curl_new(&item);
+    zv_curl_set_callback_func(item, on_answer);
+    zv_curl_set_progress_cb_func(item, on_progress);
+    zv_curl_set_user_data(item, w);
+    zv_curl_set_method(item, method);
+    zv_curl_set_url(item, url.c_str());
+    zv_curl_set_connect_timeout(item, 30000);
+    return item;
+}
+
+TransferItem *new_upload(Waiter *w, const std::string &url, const std::string &path, int size)
+{
+    TransferItem *item = new_item(w, ZV_CURL_HTTP_METHOD_PUT, url);
+    std::string range =
+        "Content-Range: bytes 0-" + std::to_string(size - 1) + "/" + std::to_string(size);
+    std::string length = "Content-Length: " + std::to_string(size);
+    zv_curl_set_header(item, "Content-Type: video/mp4");
+    zv_curl_set_header(item, range.c_str());
+    zv_curl_set_header(item, "Expect:");
+    zv_curl_set_header(item, length.c_str());
+    zv_curl_set_file_info(item, path.c_str(), size, 0);
+    return item;
+}
+
+struct Target {
+    std::string base; // http://127.0.0.1:PORT
+    bool devserver = false;
+    std::string token = "bench-token";
+    std::string api_key = "bench-key";
+
+    // An address to PUT a file to: made by the metadata POST on the devserver.
+    std::string upload_url()
+    {
+        if (!devserver)
+            return base + "/upload/bench";
+        Waiter w;
+        std::string url = base + "/resumable/feeds/api/users/default/uploads";
+        TransferItem *item = new_item(&w, ZV_CURL_HTTP_METHOD_POST, url);
+        const char *doc = "<?xml version=\"1.0\"?>\r\n<entry xmlns=\"http://www.w3.org/2005/Atom\" "
+                          "xmlns:media=\"http://search.yahoo.com/mrss/\"><media:group>"
+                          "<media:title type=\"plain\">bench</media:title>"
+                          "<media:category>People</media:category></media:group></entry>";
+        std::string auth = "Authorization: Bearer " + token;
+        std::string key = "X-ZvData-Key: key=" + api_key;
+        zv_curl_set_header(item, "Content-Type: application/atom+xml; charset=UTF-8");
+        zv_curl_set_header(item, "ZvData-Version: 2");
+        zv_curl_set_header(item, auth.c_str());
+        zv_curl_set_header(item, key.c_str());
+        zv_curl_set_header(item, "Slug: bench.mp4");
+        zv_curl_set_body(item, doc, static_cast<int>(strlen(doc)));
+        zv_curl_send_request(item);
+        w.wait(30);
+        zv_curl_delete(&item);
+        size_t at = w.header.find("Location: ");
+        if (at == std::string::npos)
+            return "";
+        return w.header.substr(at + 10, w.header.find('\r', at) - at - 10);
+    }
+};
+
+// Removes the uploads a devserver stored (nothing without a storage folder).
+void drop_stored(const std::string &storage)
+{
+    if (storage.empty())
+        return;
+    std::string cmd = "rm -f '" + storage + "'/*.data";
+    if (system(cmd.c_str()) != 0)
+        fprintf(stderr, "could not empty %s\n", storage.c_str());
+}
+
+struct RunResult {
+    double wall = 0, cpu = 0;
+    bool ok = false;
+};
+
+RunResult engine_upload(Target &target, const std::string &path, int size, long *peak_rss_growth)
+{
+    RunResult r;
+    std::string url = target.upload_url();
+    if (url.empty())
+        return r;
+    Waiter w;
+    TransferItem *item = new_upload(&w, url, path, size);
+    long base_rss = rss_kib(), peak = base_rss;
+    double cpu0 = self_cpu();
+    auto t0 = Clock::now();
+    zv_curl_send_request(item);
+    while (!w.wait(0.05))
+        peak = std::max(peak, rss_kib());
+    r.wall = seconds_since(t0);
+    r.cpu = self_cpu() - cpu0;
+    r.ok = w.http_code == 200 || w.http_code == 201;
+    if (peak_rss_growth)
+        *peak_rss_growth = std::max(*peak_rss_growth, peak - base_rss);
+    zv_curl_delete(&item);
+    return r;
+}
+
+RunResult curl_upload(Target &target, const std::string &path)
+{
+    RunResult r;
+    std::string url = target.upload_url();
+    if (url.empty())
+        return r;
+    auto t0 = Clock::now();
+    pid_t pid = fork();
+    if (pid == 0) {
+        int null_fd = open("/dev/null", O_WRONLY);
+        dup2(null_fd, STDOUT_FILENO);
+        execlp("curl", "curl", "-sS", "-o", "/dev/null", "-T", path.c_str(), url.c_str(),
+               (char *)nullptr);
+        _exit(127);
+    }
+    int status = 0;
+    rusage ru{};
+    wait4(pid, &status, 0, &ru);
+    r.wall = seconds_since(t0);
+    r.cpu = cpu_seconds(ru);
+    r.ok = WIFEXITED(status) && WEXITSTATUS(status) == 0;
+    return r;
+}
+
+// A listener of this process that notes when the first byte of a connection arrives.
+class FirstByteProbe
+{
+  public:
+    FirstByteProbe()
+    {
+        fd_ = socket(AF_INET, SOCK_STREAM, 0);
+        sockaddr_in addr{};
+        addr.sin_family = AF_INET;
+        addr.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
+        socklen_t len = sizeof addr;
+        bind(fd_, reinterpret_cast<sockaddr *>(&addr), len);
+        listen(fd_, 8);
+        getsockname(fd_, reinterpret_cast<sockaddr *>(&addr), &len);
+        port_ = ntohs(addr.sin_port);
+    }
+    ~FirstByteProbe() { close(fd_); }
+    std::string url() const { return "http://127.0.0.1:" + std::to_string(port_) + "/probe"; }
+
+    // Waits for one connection and its first byte; answers it so the request completes.
+    Clock::time_point serve_one()
+    {
+        int conn = accept(fd_, nullptr, nullptr);
+        char c;
+        recv(conn, &c, 1, 0);
+        Clock::time_point at = Clock::now();
+        char buf[4096];
+        pollfd pfd{conn, POLLIN, 0};
+        while (poll(&pfd, 1, 100) > 0 && recv(conn, buf, sizeof buf, MSG_DONTWAIT) > 0) {
+        }
+        const char *answer = "HTTP/1.1 200 OK\r\nContent-Length: 0\r\nConnection: close\r\n\r\n";
+        send(conn, answer, strlen(answer), MSG_NOSIGNAL);
+        close(conn);
+        return at;
+    }
+
+  private:
+    int fd_ = -1;
+    int port_ = 0;
+};
+
+double median(std::vector<double> v)
+{
+    std::sort(v.begin(), v.end());
+    return v.empty() ? 0 : v[v.size() / 2];
+}
+
+void report(const char *name, const std::string &figure, const char *target, bool pass)
+{
+    printf("%-34s %-44s target %-14s %s\n", name, figure.c_str(), target, pass ? "PASS" : "MISS");
+}
+
+std::string fmt(const char *f, double a, double b = 0, double c = 0)
+{
+    char buf[160];
+    snprintf(buf, sizeof buf, f, a, b, c);
+    return buf;
+}
+
+} // namespace
+
+int main(int argc, char **argv)
+{
+    int size_mib = 1024, rounds = 3, requests = 10000;
+    std::string devserver;
+    for (int i = 1; i < argc; ++i) {
+        std::string a = argv[i];
+        if (a == "--sink")
+            return run_sink();
+        if (a == "--size-mib" && i + 1 < argc)
+            size_mib = atoi(argv[++i]);
+        else if (a == "--rounds" && i + 1 < argc)
+            rounds = atoi(argv[++i]);
+        else if (a == "--requests" && i + 1 < argc)
+            requests = atoi(argv[++i]);
+        else if (a == "--devserver" && i + 1 < argc)
+            devserver = argv[++i];
+        else {
+            fprintf(stderr, "zv-engine-bench: unknown argument %s\n", argv[i]);
+            return 2;
+        }
+    }
+    // The engine logs every request; the figures are about the transfers.
+    setenv("ZV_DLOG_FILE", getenv("ZV_BENCH_LOG") ? getenv("ZV_BENCH_LOG") : "/dev/null", 1);
+    for (const char *var : {"http_proxy", "https_proxy", "HTTP_PROXY", "ALL_PROXY", "all_proxy"})
+        unsetenv(var);
+    signal(SIGPIPE, SIG_IGN);
+
+    char tmpl[] = "/tmp/zv-engine-bench-XXXXXX";
+    if (!mkdtemp(tmpl)) {
+        perror("mkdtemp");
+        return 1;
+    }
+    std::string dir = tmpl;
+    std::string path = dir + "/upload.bin";
+    const long long size = static_cast<long long>(size_mib) * 1024 * 1024;
+    {
+        FILE *f = fopen(path.c_str(), "wb");
+        std::vector<char> block(8 << 20);
+        for (size_t i = 0; i < block.size(); ++i)
+            block[i] = static_cast<char>(i * 131 + (i >> 13));
+        for (long long left = size; f && left > 0; left -= static_cast<long long>(block.size()))
+            fwrite(block.data(), 1, std::min<long long>(left, block.size()), f);
+        if (!f || fclose(f) != 0) {
+            perror("writing the upload file");
+            return 1;
+        }
+    }
+
+    Target target;
+    int port = 0;
+    pid_t server;
+    // The devserver keeps what it receives; in memory (and removed after each upload) its
+    // disk does not become the figure.
+    std::string storage;
+    if (!devserver.empty()) {
+        target.devserver = true;
+        char shm[] = "/dev/shm/zv-engine-bench-XXXXXX";
+        storage = mkdtemp(shm) ? shm : dir + "/storage";
+        server = spawn_server({devserver, "--port", "0", "--storage", storage, "--token",
+                               target.token, "--api-key", target.api_key},
+                              &port);
+    } else {
+        char self[4096];
+        ssize_t n = readlink("/proc/self/exe", self, sizeof self - 1);
+        self[n > 0 ? n : 0] = '\0';
+        server = spawn_server({self, "--sink"}, &port);
+    }
+    if (server <= 0 || port <= 0) {
+        fprintf(stderr, "zv-engine-bench: the server did not start\n");
+        return 1;
+    }
+    target.base = "http://127.0.0.1:" + std::to_string(port);
+    printf("server: %s on port %d; file %d MiB; %d rounds\n",
+           target.devserver ? "zuvo-devserver" : "sink", port, size_mib, rounds);
+
+    zv_curl_init_service();
+    int failures = 0;
+
+    // 1, 2: throughput and CPU of one upload, engine and curl alternately.
+    std::vector<double> engine_rate, curl_rate, engine_cpu, curl_cpu, rate_ratio, cpu_ratio;
+    long rss_growth = 0;
+    double gib = size / (1024.0 * 1024 * 1024);
+    for (int i = 0; i < rounds; ++i) {
+        // Alternate who goes first, in case one upload slows the next.
+        RunResult e, c;
+        if (i % 2 == 0) {
+            e = engine_upload(target, path, static_cast<int>(size), &rss_growth);
+            drop_stored(storage);
+            c = curl_upload(target, path);
+        } else {
+            c = curl_upload(target, path);
+            drop_stored(storage);
+            e = engine_upload(target, path, static_cast<int>(size), &rss_growth);
+        }
+        drop_stored(storage);
+        if (!e.ok || !c.ok) {
+            fprintf(stderr, "round %d failed (engine %d, curl %d)\n", i, e.ok, c.ok);
+            ++failures;
+            continue;
+        }
+        rate_ratio.push_back(c.wall / e.wall);
+        cpu_ratio.push_back(e.cpu / std::max(c.cpu, 1e-6));
+        engine_rate.push_back(size / e.wall / (1 << 20));
+        curl_rate.push_back(size / c.wall / (1 << 20));
+        engine_cpu.push_back(e.cpu / gib);
+        curl_cpu.push_back(c.cpu / gib);
+        printf("  round %d: engine %.0f MiB/s %.2f s CPU, curl %.0f MiB/s %.2f s CPU\n", i,
+               engine_rate.back(), e.cpu, curl_rate.back(), c.cpu);
+    }
+    bool all_pass = failures == 0;
+    if (!engine_rate.empty()) {
+        // Each figure is the median of the rounds' own ratios (a round's two uploads share
+        // the machine's conditions), beside the medians of the plain numbers.
+        double ratio = median(rate_ratio);
+        bool pass = ratio >= 0.9;
+        all_pass &= pass;
+        report("upload throughput (median)",
+               fmt("engine %.0f MiB/s, curl %.0f MiB/s: %.2fx", median(engine_rate),
+                   median(curl_rate), ratio),
+               ">= 0.90x", pass);
+        double cpu = median(cpu_ratio);
+        pass = cpu <= 1.5;
+        all_pass &= pass;
+        report("CPU user+sys per GiB (median)",
+               fmt("engine %.2f s, curl %.2f s: %.2fx", median(engine_cpu), median(curl_cpu), cpu),
+               "<= 1.50x", pass);
+        bool rss_pass = rss_growth < 32 * 1024;
+        all_pass &= rss_pass;
+        report("resident memory during upload",
+               fmt("grew %.1f MiB at most, for a %.0f MiB file", rss_growth / 1024.0, size_mib),
+               "< 32 MiB", rss_pass);
+    }
+
+    // 3: the worker's CPU while its only transfer is paused for 5 s.
+    {
+        std::string url = target.upload_url();
+        Waiter w;
+        TransferItem *item = new_upload(&w, url, path, static_cast<int>(size));
+        zv_curl_send_request(item);
+        while (w.reads == 0)
+            std::this_thread::sleep_for(std::chrono::milliseconds(1));
+        zv_curl_pause_request(item);
+        int reads = w.reads;
+        double cpu0 = self_cpu();
+        std::this_thread::sleep_for(std::chrono::seconds(5));
+        double percent = (self_cpu() - cpu0) / 5.0 * 100.0;
+        bool held = w.reads == reads;
+        zv_curl_cancel_request(item);
+        zv_curl_delete(&item);
+        bool pass = percent < 1.0 && held;
+        all_pass &= pass;
+        report("worker CPU, only transfer paused",
+               fmt("%.3f %% of a core over 5 s", percent) + (held ? "" : " (it moved!)"), "< 1 %",
+               pass);
+    }
+
+    // 4: from send on an idle engine to the first byte at the server.
+    {
+        FirstByteProbe probe;
+        std::vector<double> delays;
+        for (int i = 0; i < 10; ++i) {
+            std::this_thread::sleep_for(std::chrono::milliseconds(300)); // the worker is idle
+            Waiter w;
+            TransferItem *item = new_item(&w, ZV_CURL_HTTP_METHOD_GET, probe.url());
+            Clock::time_point arrived;
+            std::thread server_side([&] { arrived = probe.serve_one(); });
+            auto t0 = Clock::now();
+            zv_curl_send_request(item);
+            server_side.join();
+            delays.push_back(std::chrono::duration<double, std::milli>(arrived - t0).count());
+            w.wait(10);
+            zv_curl_delete(&item);
+        }
+        double worst = *std::max_element(delays.begin(), delays.end());
+        bool pass = worst < 50;
+        all_pass &= pass;
+        report("send to first byte, idle engine",
+               fmt("median %.2f ms, max %.2f ms over 10", median(delays), worst), "< 50 ms", pass);
+    }
+
+    // 5: memory over many small requests, each on a fresh item released after its answer.
+    if (requests >= 1000) {
+        long at_first = 0, at_end = 0;
+        Waiter w;
+        for (int i = 0; i < requests; ++i) {
+            w.reset();
+            TransferItem *item = new_item(&w, ZV_CURL_HTTP_METHOD_POST, target.base + "/small");
+            zv_curl_set_header(item, "Content-Type: application/x-www-form-urlencoded");
+            zv_curl_set_body(item, "a=1&b=2", 7);
+            zv_curl_send_request(item);
+            w.wait(30);
+            zv_curl_delete(&item);
+            if (i == requests / 10 - 1)
+                at_first = rss_kib();
+        }
+        at_end = rss_kib();
+        double growth = (at_end - at_first) / 1024.0;
+        bool pass = growth < 2.0;
+        all_pass &= pass;
+        report("resident memory over requests",
+               fmt("%.2f MiB growth from request %.0f to %.0f", growth, requests / 10.0, requests),
+               "< 2 MiB", pass);
+    }
+
+    zv_curl_finalize_service();
+    kill(server, SIGTERM);
+    waitpid(server, nullptr, 0);
+    unlink(path.c_str());
+    std::string rm = "rm -rf '" + dir + "'" + (storage.empty() ? "" : " '" + storage + "'");
+    if (system(rm.c_str()) != 0)
+        fprintf(stderr, "could not remove %s\n", dir.c_str());
+    printf("%s\n", all_pass ? "all figures met" : "some figures missed");
+    return 0;
+}

@@ -1,0 +1,20 @@
+#!/usr/bin/env bash
+# Builds and runs the benchmarks, printing each figure with its target.
+# ZV_BENCH_BUILD: the build folder (default build/). Arguments go to zv-engine-bench
+# (--size-mib N, --rounds N, --requests N). The server is zuvo-devserver when the build has
+# it, else the benchmark's own sink server.
+set -euo pipefail
+cd "$(dirname "$0")/.."
+
+build="${ZV_BENCH_BUILD:-build}"
+if [ ! -f "$build/CMakeCache.txt" ]; then
+  cmake -S . -B "$build" -DCMAKE_BUILD_TYPE=RelWithDebInfo
+fi
+cmake --build "$build" -j"$(nproc)" --target zv-engine-bench
+if cmake --build "$build" -j"$(nproc)" --target zuvo-devserver >/dev/null 2>&1 \
+   && [ -x "$build/bin/zuvo-devserver" ]; then
+  set -- --devserver "$build/bin/zuvo-devserver" "$@"
+fi
+
+echo "== transfer engine =="
+"$build/bin/zv-engine-bench" "$@"
