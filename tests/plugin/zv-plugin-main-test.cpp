@@ -1,0 +1,768 @@
+// The service client against zuvo-devserver on loopback: what each request puts on the wire
+// (read back from the server's request log), what reaches the response callback, and the
+// refusals that happen before anything is sent. Grouped by request kind.
+#include <gtest/gtest.h>
+#include <key_storage.h>
+#include <poll.h>
+#include <signal.h>
+#include <stdlib.h>
+#include <string.h>
+#include <sys/stat.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <glib.h>
+
+#include <algorithm>
+#include <memory>
+#include <mutex>
+#include <optional>
+#include <sstream>
+#include <string>
+#include <utility>
+#include <vector>
+
+#include "zv-plugin-main.h"
+#include "zv-plugin-xml.h"
+#include "zv-test-util.h"
+
+namespace {
+
+using zv_test::read_file;
+using zv_test::wait_for;
+using Headers = std::vector<std::pair<std::string, std::string>>;
+
+const char TOKEN[] = "access-token-1";
+const char API_KEY[] = "api-key-1";
+const char ISSUED_TOKEN[] = "issued-token-1";
+const char USER_AGENT[] = "Mozilla/5.0 (Linux; Tizen 2.4; HALVANE QX-M410) AppleWebKit/537.3 "
+                          "(KHTML, like Gecko) HalvaneBrowser/1.1 Mobile Safari/537.3";
+
+// --- The server's request log: one JSON object per line ---
+
+// The JSON string whose opening quote is at text[pos]; pos ends past its closing quote.
+std::string json_string(const std::string &text, size_t &pos)
+{
+    std::string out;
+    for (pos++; pos < text.size() && text[pos] != '"'; pos++) {
+        if (text[pos] != '\\') {
+            out += text[pos];
+        } else if (text[++pos] == 'u') {
+            char utf8[8] = {0};
+            g_unichar_to_utf8((gunichar)std::stoul(text.substr(pos + 1, 4), nullptr, 16), utf8);
+            out += utf8;
+            pos += 4;
+        } else {
+            const char *hit = strchr("nrt", text[pos]);
+            out += hit ? "\n\r\t"[hit - "nrt"] : text[pos];
+        }
+    }
+    pos++;
+    return out;
+}
+
+// One request as the server logged it.
+struct Logged {
+    std::string line;
+    Headers headers;
+
+    explicit Logged(const std::string &l) : line(l)
+    {
+        size_t pos = line.find("\"headers\":[") + 11;
+        while (line.compare(pos, 2, "[\"") == 0) {
+            pos++;
+            std::string name = json_string(line, pos);
+            pos++; // ','
+            headers.emplace_back(name, json_string(line, pos));
+            pos += line.compare(pos, 2, "],") == 0 ? 2 : 1;
+        }
+    }
+    // A member's value: a string unquoted, anything else as written.
+    std::string get(const std::string &key) const
+    {
+        size_t pos = line.find("\"" + key + "\":");
+        if (pos == std::string::npos)
+            return "";
+        pos += key.size() + 3;
+        if (line[pos] == '"')
+            return json_string(line, pos);
+        return line.substr(pos, line.find_first_of(",}", pos) - pos);
+    }
+    std::string body() const
+    {
+        gsize len = 0;
+        guchar *bytes = g_base64_decode(get("body_base64").c_str(), &len);
+        std::string out(reinterpret_cast<char *>(bytes), len);
+        g_free(bytes);
+        return out;
+    }
+    std::optional<std::string> header(const std::string &name) const
+    {
+        for (const auto &h : headers)
+            if (h.first == name)
+                return h.second;
+        return std::nullopt;
+    }
+};
+
+// zuvo-devserver for one test, in its own folder; stopped by its pid.
+class DevServer {
+public:
+    DevServer(const std::string &dir, std::vector<std::string> args) : dir_(dir)
+    {
+        mkdir(dir.c_str(), 0700);
+        args.insert(args.begin(), {zv_test::bin_path("zuvo-devserver"), "--storage",
+                                   dir + "/store", "--log", dir + "/requests.jsonl"});
+        const bool tls = std::count(args.begin(), args.end(), "--tls-port") > 0;
+        int out[2];
+        if (pipe(out) != 0)
+            return;
+        pid_ = fork();
+        if (pid_ == 0) {
+            dup2(out[1], 1);
+            std::vector<char *> argv;
+            for (auto &a : args)
+                argv.push_back(&a[0]);
+            argv.push_back(nullptr);
+            execv(argv[0], argv.data());
+            _exit(127);
+        }
+        close(out[1]);
+        std::string text;
+        char buf[256];
+        pollfd pfd = {out[0], POLLIN, 0};
+        ssize_t n = 0;
+        while (std::count(text.begin(), text.end(), '\n') < (tls ? 2 : 1) &&
+               poll(&pfd, 1, 20000) > 0 && (n = read(out[0], buf, sizeof buf)) > 0)
+            text.append(buf, (size_t)n);
+        close(out[0]);
+        sscanf(text.c_str(), "port %d\ntls-port %d", &port_, &tls_port_);
+    }
+    ~DevServer()
+    {
+        if (pid_ > 0) {
+            kill(pid_, SIGTERM);
+            waitpid(pid_, nullptr, 0);
+        }
+    }
+
+    int port() const { return port_; }
+    std::string host() const { return "127.0.0.1:" + std::to_string(port_); }
+    std::string tls_host() const { return "127.0.0.1:" + std::to_string(tls_port_); }
+    std::string stored(const std::string &upload_id) const
+    {
+        return read_file(dir_ + "/store/" + upload_id + ".data");
+    }
+    std::vector<Logged> requests() const
+    {
+        std::vector<Logged> all;
+        std::istringstream lines(read_file(dir_ + "/requests.jsonl"));
+        for (std::string line; std::getline(lines, line);)
+            all.emplace_back(line);
+        return all;
+    }
+
+private:
+    std::string dir_;
+    pid_t pid_ = -1;
+    int port_ = 0, tls_port_ = 0;
+};
+
+// --- What reaches the handles' callbacks (worker thread) ---
+
+struct Answer {
+    int result, http_code, resp_type;
+    std::optional<std::string> value;
+};
+
+struct Inbox {
+    std::mutex mutex;
+    std::vector<Answer> answers;
+    std::vector<int> percents;
+
+    size_t count()
+    {
+        std::lock_guard<std::mutex> lock(mutex);
+        return answers.size();
+    }
+    Answer last()
+    {
+        std::lock_guard<std::mutex> lock(mutex);
+        return answers.back();
+    }
+};
+
+void on_answer(int result, ServiceResponse *resp, void *user_data)
+{
+    auto *inbox = static_cast<Inbox *>(user_data);
+    std::lock_guard<std::mutex> lock(inbox->mutex);
+    inbox->answers.push_back({result, resp->http_code, resp->resp_type,
+                              resp->value ? std::optional<std::string>(resp->value)
+                                          : std::nullopt});
+}
+
+void on_progress(ServiceRequest *, int percent, void *user_data)
+{
+    auto *inbox = static_cast<Inbox *>(user_data);
+    std::lock_guard<std::mutex> lock(inbox->mutex);
+    inbox->percents.push_back(percent);
+}
+
+// A handle whose answers and progress go to `inbox`.
+struct Handle {
+    ServiceRequest *h = zv_request_new();
+    explicit Handle(Inbox *inbox = nullptr)
+    {
+        zv_set_callback_func(h, inbox ? on_answer : nullptr);
+        zv_set_progress_callback_func(h, inbox ? on_progress : nullptr);
+        zv_set_user_data(h, inbox);
+    }
+    ~Handle() { zv_request_free(h); }
+};
+
+// The platform log of this test process (opened by the first log line, so set up first).
+std::string log_path()
+{
+    static const std::string path = [] {
+        std::string p = "/tmp/zv-plugin-main-test-" + std::to_string(getpid()) + ".log";
+        setenv("ZV_DLOG_FILE", p.c_str(), 1);
+        return p;
+    }();
+    return path;
+}
+
+class ClientEnvironment : public ::testing::Environment {
+    void SetUp() override { log_path(); }
+    void TearDown() override
+    {
+        zv_finalize_service();
+        unlink(log_path().c_str());
+    }
+};
+const auto *const g_environment = ::testing::AddGlobalTestEnvironment(new ClientEnvironment);
+
+class ClientTest : public ::testing::Test {
+protected:
+    void SetUp() override
+    {
+        log_start_ = read_file(log_path()).size();
+        ASSERT_TRUE(zv_init_service());
+        ASSERT_EQ(key_storage_set("zuvo.tizen.api.key", API_KEY), 0);
+        start_server();
+        ASSERT_GT(server_->port(), 0);
+        std::string bytes(10000, '\0');
+        for (size_t i = 0; i < bytes.size(); i++)
+            bytes[i] = (char)(i * 7 + i / 256);
+        ASSERT_TRUE(zv_test::write_file(clip_, bytes));
+    }
+
+    // (Re)starts the server in a fresh folder with the fixture's arguments and `extra`.
+    void start_server(const std::vector<std::string> &extra = {})
+    {
+        std::vector<std::string> args = server_args();
+        args.insert(args.end(), extra.begin(), extra.end());
+        server_.reset();
+        server_ = std::make_unique<DevServer>(tmp_.file("server" + std::to_string(++starts_)),
+                                              args);
+        setenv("ZV_UPLOAD_HOST", server_->host().c_str(), 1);
+        setenv("ZV_DATA_HOST", server_->host().c_str(), 1);
+    }
+    virtual std::vector<std::string> server_args()
+    {
+        return {"--token", TOKEN, "--api-key", API_KEY};
+    }
+
+    // Messages the client (not the engine) logged at error level since log_start_.
+    std::vector<std::string> errors() const
+    {
+        std::vector<std::string> out;
+        std::istringstream lines(read_file(log_path()).substr(log_start_));
+        for (std::string line; std::getline(lines, line);) {
+            const size_t at = line.find("\033[31m[TID:");
+            if (line.rfind("E/zuvo-plugin(", 0) != 0 || at == std::string::npos ||
+                line.find(": zv-plugin-main.cpp: ") == std::string::npos)
+                continue;
+            const size_t msg = line.find("] ", at) + 2;
+            out.push_back(line.substr(msg, line.size() - msg - strlen("\033[0m")));
+        }
+        return out;
+    }
+
+    // Issues the request and waits for its answer.
+    Answer send(int (*request)(ServiceRequest *), const Handle &handle)
+    {
+        const size_t before = inbox_.count();
+        EXPECT_EQ(request(handle.h), 0);
+        EXPECT_TRUE(wait_for([&] { return inbox_.count() > before; }, 60000));
+        return inbox_.count() > before ? inbox_.last() : Answer{1, 1, 1, std::nullopt};
+    }
+    void set_meta(const Handle &meta, const char *token = TOKEN)
+    {
+        zv_set_attr_token(meta.h, token);
+        zv_set_attr_title(meta.h, "Clip &amp; co");
+        zv_set_attr_category(meta.h, "Film");
+        zv_set_attr_file_path(meta.h, clip_.c_str());
+    }
+    // A new upload on the server: its address.
+    std::string create_upload()
+    {
+        Handle meta(&inbox_);
+        set_meta(meta);
+        return send(zv_request_meta_upload, meta).value.value_or("");
+    }
+    Answer data_upload(const std::string &url, int offset, const std::string &path)
+    {
+        Handle data(&inbox_);
+        zv_set_attr_upload_url(data.h, url.c_str());
+        zv_set_attr_file_offset(data.h, offset);
+        zv_set_attr_file_path(data.h, path.c_str());
+        return send(zv_request_data_upload, data);
+    }
+    Answer status_query(const std::string &url)
+    {
+        Handle query(&inbox_);
+        zv_set_attr_upload_url(query.h, url.c_str());
+        return send(zv_request_upload_query, query);
+    }
+
+    zv_test::TempDir tmp_;
+    std::unique_ptr<DevServer> server_;
+    const std::string clip_ = tmp_.file("clip.mp4");
+    Inbox inbox_;
+    size_t log_start_ = 0;
+    int starts_ = 0;
+};
+
+// --- Service lifetime, attributes and refusals ---
+
+TEST_F(ClientTest, ServiceStartsOnceAndStopsOnce)
+{
+    zv_finalize_service();
+    zv_finalize_service();
+    EXPECT_TRUE(zv_init_service());
+    EXPECT_TRUE(zv_init_service());
+    const std::string log = read_file(log_path()).substr(log_start_);
+    EXPECT_NE(log.find("] Not yet start servie\n"), std::string::npos);
+    EXPECT_NE(log.find("] Already init servie\n"), std::string::npos);
+    EXPECT_FALSE(create_upload().empty()); // the restarted engine serves requests
+}
+
+TEST_F(ClientTest, MissingValuesAreRefusedBeforeAnyTransfer)
+{
+    Handle a, m, d, l;
+    // Each row may first set what the previous row lacked; rows run in order.
+    const struct {
+        int result, code;
+        const char *message;
+    } rows[] = {
+        {zv_set_attr_user_id(a.h, nullptr), -996, "id is NULL"},
+        {zv_set_attr_user_pwd(a.h, nullptr), -995, "pwd is NULL"},
+        {zv_set_attr_token(a.h, nullptr), -994, "token is NULL"},
+        {zv_set_attr_upload_url(a.h, nullptr), -983, "url is NULL"},
+        {zv_set_attr_title(a.h, nullptr), -993, "title is NULL"},
+        {zv_set_attr_description(a.h, nullptr), -992, "description is NULL"},
+        {zv_set_attr_category(a.h, nullptr), -991, "category is NULL"},
+        {zv_set_attr_keyword(a.h, nullptr), -990, "keyword is NULL"},
+        {zv_set_attr_file_path(a.h, nullptr), -988, "file_path is NULL"},
+        {zv_set_attr_file_offset(a.h, -1), -987, "invalid offset value"},
+        {zv_set_attr_region(a.h, nullptr), -986, "region is NULL"},
+        {zv_set_attr_location(a.h, nullptr), -985, "location is NULL"},
+        {zv_set_attr_refresh_token(a.h, nullptr), -994, "refresh_token is NULL"},
+        {zv_set_attr_gps(nullptr, 1, 2), -997, "handle is NULL"},
+        {zv_set_callback_func(nullptr, on_answer), -997, "handle is NULL"},
+        {zv_request_free(nullptr), -997, "handle data is NULL"},
+        {zv_request_meta_upload(m.h), -994, "token is NULL"},
+        {(zv_set_attr_token(m.h, TOKEN), zv_request_meta_upload(m.h)), -993, "title is NULL"},
+        {(zv_set_attr_title(m.h, "t"), zv_request_meta_upload(m.h)), -991, "category is NULL"},
+        {(zv_set_attr_category(m.h, "c"), zv_request_meta_upload(m.h)), -988, "file path is NULL"},
+        {zv_request_data_upload(d.h), -988, "file_path data is NULL"},
+        {(zv_set_attr_file_path(d.h, clip_.c_str()), zv_request_data_upload(d.h)), -983,
+         "upload_url data is NULL"},
+        {zv_request_upload_query(d.h), -983, "upload_url data is NULL"},
+        {zv_request_upload_pause(d.h), -998, "curl data is NULL"},
+        {zv_request_upload_resume(d.h), -998, "curl data is NULL"},
+        {zv_request_upload_cancel(d.h), -998, "curl data is NULL"},
+        {zv_request_login(l.h), -996, "id is NULL"},
+        {(zv_set_attr_user_id(l.h, "me"), zv_request_login(l.h)), -995, "pwd is NULL"},
+        {zv_request_get_token(l.h), -994, "refresh toekn is NULL"},
+        {zv_request_upload_query(nullptr), -997, "handle is NULL"},
+    };
+    std::vector<std::string> expected;
+    for (const auto &row : rows) {
+        EXPECT_EQ(row.result, row.code) << row.message;
+        expected.push_back(row.message);
+    }
+    EXPECT_EQ(errors(), expected);
+    for (const Handle *h : {&a, &m, &d, &l})
+        EXPECT_EQ(h->h->transfer, nullptr);
+    EXPECT_TRUE(server_->requests().empty());
+}
+
+TEST_F(ClientTest, FailedStepsReleaseTheTransferAndKeepTheAttributes)
+{
+    Handle meta(&inbox_);
+    set_meta(meta);
+    ASSERT_EQ(unlink(tmp_.file("keys/zuvo.tizen.api.key").c_str()), 0);
+    EXPECT_EQ(zv_request_meta_upload(meta.h), ZV_ERROR_KEY_STORAGE);
+    EXPECT_EQ(meta.h->transfer->url, nullptr); // emptied
+
+    Handle data(&inbox_); // a file that cannot be opened has size -1, which the engine refuses
+    zv_set_attr_upload_url(data.h, ("http://" + server_->host() + "/x").c_str());
+    zv_set_attr_file_path(data.h, tmp_.file("missing.mp4").c_str());
+    EXPECT_EQ(zv_request_data_upload(data.h), ZV_ERROR_REQUEST_FAIL);
+    EXPECT_EQ(data.h->transfer->url, nullptr);
+    EXPECT_EQ(errors(), (std::vector<std::string>{"key_storage_get fail",
+                                                  "zv_curl_set_file_info fail"}));
+    EXPECT_TRUE(server_->requests().empty());
+
+    // The metadata handle again, once the key is back: its attributes were kept.
+    ASSERT_EQ(key_storage_set("zuvo.tizen.api.key", API_KEY), 0);
+    EXPECT_EQ(send(zv_request_meta_upload, meta).result, 0);
+    ASSERT_EQ(server_->requests().size(), 1u);
+    EXPECT_NE(server_->requests()[0].body().find(">Clip &amp; co</media:title>"),
+              std::string::npos);
+}
+
+// --- Metadata upload ---
+
+struct MetaCase {
+    const char *name, *description, *keyword, *location;
+    int privacy;
+    double latitude, longitude;
+    const char *position; // as gml:pos must read
+};
+
+std::string expected_entry(const MetaCase &c, const std::string &host)
+{
+    const std::string line = "\n    ";
+    std::string d = "<?xml version=\"1.0\"?>\r\n<entry xmlns=\"http://www.w3.org/2005/Atom\" "
+                    "xmlns:media=\"http://search.yahoo.com/mrss/\" xmlns:zv=\"http://" +
+                    host + "/schemas/2007\"";
+    if (c.position)
+        d += " xmlns:georss=\"http://www.georss.org/georss\" xmlns:gml=\"http://www.opengis.net/gml\"";
+    d += ">\n  <media:group>" + line + "<media:title type=\"plain\">Clip &amp; co</media:title>";
+    if (c.description)
+        d += line + "<media:description type=\"plain\">" + c.description + "</media:description>";
+    d += line + "<media:category scheme=\"http://" + host +
+         "/schemas/2007/categories.cat\">Film</media:category>";
+    if (c.keyword)
+        d += line + "<media:keywords>" + c.keyword + "</media:keywords>";
+    if (c.privacy == 2)
+        d += line + "<zv:private/>";
+    d += "\n  </media:group>\n";
+    if (c.location)
+        d += std::string("  <zv:location>") + c.location + "</zv:location>\n";
+    if (c.privacy >= 0 && c.privacy <= 2)
+        d += std::string("  <zv:accessControl action=\"list\" permission=\"") +
+             (c.privacy == 0 ? "allowed" : "denied") + "\"/>\n";
+    if (c.position)
+        d += std::string("  <georss:where>\n    <gml:Point>\n      <gml:pos>") + c.position +
+             "</gml:pos>\n    </gml:Point>\n  </georss:where>\n";
+    return d + "</entry>";
+}
+
+TEST_F(ClientTest, MetaUploadSendsHeadersAndEntryInOrder)
+{
+    const MetaCase cases[] = {
+        {"public, title and category only", nullptr, nullptr, nullptr, 0, 0.0, 0.0, nullptr},
+        {"unlisted", nullptr, nullptr, nullptr, 1, 0.0, 0.0, nullptr},
+        {"private with description and tags", "A day", "sea, sand", nullptr, 2, 0.0, 0.0, nullptr},
+        {"privacy 3 with a position", nullptr, nullptr, nullptr, 3, 37.5, 0.0,
+         "37.500000 0.000000"},
+        {"everything", "A day", "sea", "Busan", 0, -33.8688, 151.2093, "-33.868800 151.209300"},
+    };
+    for (const auto &c : cases) {
+        Handle meta(&inbox_);
+        set_meta(meta);
+        zv_set_attr_privacy(meta.h, c.privacy);
+        zv_set_attr_gps(meta.h, c.latitude, c.longitude);
+        if (c.description)
+            zv_set_attr_description(meta.h, c.description);
+        if (c.keyword)
+            zv_set_attr_keyword(meta.h, c.keyword);
+        if (c.location)
+            zv_set_attr_location(meta.h, c.location);
+        const Answer a = send(zv_request_meta_upload, meta);
+
+        const Logged r = server_->requests().back();
+        const std::string document = expected_entry(c, server_->host());
+        EXPECT_EQ(r.get("method") + " " + r.get("target"),
+                  "POST /resumable/feeds/api/users/default/uploads");
+        EXPECT_EQ(r.body(), document) << c.name;
+        const Headers expected = {
+            {"Host", server_->host()},
+            {"User-Agent", USER_AGENT},
+            {"Accept", "*/*"},
+            {"Accept-Encoding", "gzip,deflate"},
+            {"Content-Type", "application/atom+xml; charset=UTF-8"},
+            {"ZvData-Version", "2"},
+            {"Authorization", std::string("Bearer ") + TOKEN},
+            {"X-ZvData-Key", std::string("key=") + API_KEY},
+            {"Content-Length", std::to_string(document.size())},
+            {"Slug", "clip.mp4"},
+            {"Connection", "Keep-Alive"},
+            {"keep-alive", "100"},
+        };
+        EXPECT_EQ(r.headers, expected) << c.name;
+        EXPECT_EQ(a.result, 0);
+        EXPECT_EQ(a.http_code, 201);
+        EXPECT_EQ(a.resp_type, ZV_RESP_TYPE_META_UPLOAD);
+        EXPECT_EQ(a.value, "http://" + server_->host() + "/resumable/uploads/" + r.get("upload_id"));
+    }
+}
+
+TEST_F(ClientTest, MetaUploadAnswersThatFail)
+{
+    start_server({"--fault", "kind=meta,action=nolocation,nth=3", "--fault",
+                  "kind=meta,action=status,status=400,nth=4"});
+    const std::string long_token(600, 't');
+    const struct {
+        const char *name;
+        std::string token, host;
+        int result, http_code;
+    } cases[] = {
+        {"refused token", "wrong", server_->host(), -999, 401},
+        {"header line cut at 511", long_token, server_->host(), -999, 401},
+        {"no Location", TOKEN, server_->host(), 0, 201},
+        {"status 400", TOKEN, server_->host(), -999, 400},
+        {"nobody listening", TOKEN, "127.0.0.1:1", -999, 0},
+    };
+    for (const auto &c : cases) {
+        setenv("ZV_UPLOAD_HOST", c.host.c_str(), 1);
+        Handle meta(&inbox_);
+        set_meta(meta, c.token.c_str());
+        const Answer a = send(zv_request_meta_upload, meta);
+        EXPECT_EQ(a.result, c.result) << c.name;
+        EXPECT_EQ(a.http_code, c.http_code) << c.name;
+        EXPECT_EQ(a.value, std::nullopt) << c.name;
+    }
+    const auto requests = server_->requests();
+    ASSERT_EQ(requests.size(), 4u);
+    EXPECT_EQ(requests[1].header("Authorization"), "Bearer " + long_token.substr(0, 511 - 22));
+}
+
+// --- Data upload and status query ---
+
+TEST_F(ClientTest, DataUploadFromTheStartStoresTheWholeFile)
+{
+    const std::string url = create_upload();
+    const Answer a = data_upload(url, 0, clip_);
+    const Logged r = server_->requests().back();
+    EXPECT_EQ(r.get("method") + " " + url, "PUT http://" + server_->host() + r.get("target"));
+    const Headers expected = {
+        {"Host", server_->host()},
+        {"User-Agent", USER_AGENT},
+        {"Accept", "*/*"},
+        {"Accept-Encoding", "gzip,deflate"},
+        {"Content-Type", "video/mp4"},
+        {"Content-Range", "bytes 0-9999/10000"},
+        {"Content-Length", "10000"},
+        {"Connection", "Keep-Alive"},
+        {"keep-alive", "100"},
+    };
+    EXPECT_EQ(r.headers, expected);
+    EXPECT_EQ(a.result, 0);
+    EXPECT_EQ(a.http_code, 201);
+    EXPECT_EQ(a.resp_type, ZV_RESP_TYPE_DATA_UPLOAD);
+    EXPECT_EQ(a.value, " \"" + r.get("upload_id") + "\"");
+    EXPECT_EQ(server_->stored(r.get("upload_id")), read_file(clip_));
+    std::lock_guard<std::mutex> lock(inbox_.mutex);
+    EXPECT_TRUE(std::is_sorted(inbox_.percents.begin(), inbox_.percents.end()));
+    EXPECT_EQ(inbox_.percents.back(), 100);
+}
+
+TEST_F(ClientTest, DataUploadResumesBehindTheStatusQuery)
+{
+    start_server({"--fault", "kind=data,action=cut,bytes=4096"});
+    const std::string url = create_upload();
+    const std::string file = tmp_.file("clip.unknown"); // no known media type
+    ASSERT_EQ(rename(clip_.c_str(), file.c_str()), 0);
+
+    const Answer nothing = status_query(url);
+    EXPECT_EQ(nothing.result, 0);
+    EXPECT_EQ(nothing.http_code, 308);
+    EXPECT_EQ(nothing.value, std::nullopt); // no Range header: nothing held
+    const Answer cut = data_upload(url, 0, file);
+    EXPECT_EQ(cut.result, -999);
+    EXPECT_EQ(cut.http_code, 0);
+    const Answer held = status_query(url);
+    EXPECT_EQ(held.result, 0);
+    EXPECT_EQ(held.http_code, 308);
+    EXPECT_EQ(held.resp_type, ZV_RESP_TYPE_UPLOAD_QUERY);
+    ASSERT_EQ(held.value, "4095");
+    const Answer done = data_upload(url, std::stoi(*held.value), file);
+    EXPECT_EQ(done.result, 0);
+    EXPECT_EQ(done.http_code, 201);
+
+    std::vector<Logged> queries, puts;
+    for (const auto &r : server_->requests()) {
+        if (r.get("kind") != "meta")
+            (r.get("kind") == "status" ? queries : puts).push_back(r);
+    }
+    ASSERT_EQ(queries.size(), 2u);
+    ASSERT_EQ(puts.size(), 2u);
+    const Headers query_headers = {
+        {"Host", server_->host()},
+        {"User-Agent", USER_AGENT},
+        {"Accept-Encoding", "gzip,deflate"},
+        {"Content-Range", "bytes */*"},
+        {"Content-Length", "0"},
+    };
+    EXPECT_EQ(queries[1].get("method") + " " + queries[1].get("body_length"), "PUT 0");
+    EXPECT_EQ(queries[1].headers, query_headers);
+    const Logged &rest = puts[1];
+    EXPECT_EQ(rest.header("Content-Type"), "application/octet-stream");
+    EXPECT_EQ(rest.header("Content-Range"), "bytes 4096-9999/10000");
+    EXPECT_EQ(rest.header("Content-Length"), "5904");
+    EXPECT_EQ(rest.header("Expect"), std::nullopt);
+    EXPECT_EQ(rest.header("Transfer-Encoding"), std::nullopt);
+    EXPECT_EQ(rest.body(), read_file(file).substr(4096));
+    EXPECT_EQ(server_->stored(rest.get("upload_id")), read_file(file));
+}
+
+TEST_F(ClientTest, PausedUploadResumesAndFreedUploadNeverAnswers)
+{
+    start_server({"--fault", "kind=data,action=throttle,rate=8000,times=0"});
+    const std::string url = create_upload(), other_url = create_upload();
+    ServiceRequest *gone = zv_request_new(); // freed while the server still reads its body
+    zv_set_callback_func(gone, on_answer);
+    zv_set_user_data(gone, &inbox_);
+    zv_set_attr_upload_url(gone, other_url.c_str());
+    zv_set_attr_file_path(gone, clip_.c_str());
+    ASSERT_EQ(zv_request_data_upload(gone), 0);
+    ASSERT_EQ(zv_request_free(gone), 0);
+    Handle data(&inbox_);
+    zv_set_attr_upload_url(data.h, url.c_str());
+    zv_set_attr_file_path(data.h, clip_.c_str());
+    ASSERT_EQ(zv_request_data_upload(data.h), 0);
+    ASSERT_TRUE(wait_for([&] {
+        std::lock_guard<std::mutex> lock(inbox_.mutex);
+        return !inbox_.percents.empty();
+    }));
+    EXPECT_EQ(zv_request_upload_pause(data.h), 0);
+    EXPECT_EQ(zv_request_upload_resume(data.h), 0);
+    ASSERT_TRUE(wait_for([&] { return inbox_.count() >= 3; }, 60000));
+    EXPECT_EQ(inbox_.last().http_code, 201);
+    EXPECT_EQ(inbox_.count(), 3u); // two metadata answers and this one
+    const std::string etag = inbox_.last().value.value_or("  ");
+    EXPECT_EQ(server_->stored(etag.substr(2, etag.size() - 3)), read_file(clip_));
+    EXPECT_EQ(zv_request_upload_cancel(data.h), 0);
+}
+
+// --- Category document ---
+
+TEST_F(ClientTest, CategoryLabelsInDocumentOrderWithLanguageFallback)
+{
+    auto labels = [](const char *language) {
+        std::vector<std::string> out;
+        GList *list = zv_plugin_xml_get_category_list(language);
+        for (GList *l = list; l; l = l->next)
+            out.push_back(static_cast<char *>(l->data));
+        g_list_free_full(list, g_free);
+        return out;
+    };
+    const auto english = labels(nullptr);
+    ASSERT_EQ(english.size(), 15u);
+    EXPECT_EQ(std::vector<std::string>(english.begin(), english.begin() + 3),
+              (std::vector<std::string>{"Film & Animation", "Autos & Vehicles", "Music"}));
+    EXPECT_EQ(labels("xx"), english); // no document in that language
+    EXPECT_EQ(labels("ko").at(2), "음악");
+
+    std::vector<std::string> targets;
+    for (const auto &r : server_->requests())
+        targets.push_back(r.get("method") + " " + r.get("target"));
+    const std::string doc = "GET /schemas/2007/categories.cat";
+    EXPECT_EQ(targets, (std::vector<std::string>{doc, doc + "?hl=xx", doc, doc + "?hl=ko"}));
+}
+
+// --- Login and token refresh (https) ---
+
+class AccountTest : public ClientTest {
+protected:
+    std::vector<std::string> server_args() override
+    {
+        const std::string cert = tmp_.file("cert.pem"), key = tmp_.file("key.pem");
+        zv_test::run_program({"/usr/bin/openssl", "req", "-x509", "-newkey", "ec", "-pkeyopt",
+                              "ec_paramgen_curve:prime256v1", "-nodes", "-keyout", key, "-out",
+                              cert, "-days", "2", "-subj", "/CN=127.0.0.1", "-addext",
+                              "subjectAltName=IP:127.0.0.1"});
+        return {"--tls-port",     "0",          "--tls-cert",      cert,       "--tls-key", key,
+                "--issued-token", ISSUED_TOKEN, "--refresh-token", "refresh-1"};
+    }
+    void SetUp() override
+    {
+        ClientTest::SetUp();
+        setenv("ZV_ACCOUNT_HOST", server_->tls_host().c_str(), 1);
+        setenv("ZV_TOKEN_HOST", server_->tls_host().c_str(), 1);
+        ASSERT_EQ(key_storage_set("zuvo.tizen.client.id", "client-1"), 0);
+        ASSERT_EQ(key_storage_set("zuvo.tizen.client.secret", "secret-1"), 0);
+    }
+    Answer login(const std::string &id, const std::string &pwd)
+    {
+        Handle h(&inbox_);
+        zv_set_attr_user_id(h.h, id.c_str());
+        zv_set_attr_user_pwd(h.h, pwd.c_str());
+        return send(zv_request_login, h);
+    }
+    Answer refresh(const std::string &refresh_token)
+    {
+        Handle h(&inbox_);
+        zv_set_attr_refresh_token(h.h, refresh_token.c_str());
+        return send(zv_request_get_token, h);
+    }
+};
+
+TEST_F(AccountTest, LoginPostsTheFormUnencoded)
+{
+    const Answer a = login("me@example.org", "p&w=d");
+    EXPECT_EQ(a.result, 0);
+    EXPECT_EQ(a.resp_type, ZV_RESP_TYPE_LOGIN);
+    EXPECT_EQ(a.value, ISSUED_TOKEN);
+    login(std::string(5000, 'u'), "p");
+
+    const auto requests = server_->requests();
+    ASSERT_EQ(requests.size(), 2u);
+    EXPECT_EQ(requests[0].get("scheme") + " " + requests[0].get("method") + " " +
+                  requests[0].get("target"),
+              "https POST /accounts/ClientLogin");
+    EXPECT_EQ(requests[0].body(), "Email=me@example.org&Passwd=p&w=d&service=zuvo&source=Halvane");
+    EXPECT_EQ(requests[0].header("Content-Type"), "application/x-www-form-urlencoded");
+    EXPECT_EQ(requests[0].header("User-Agent"), USER_AGENT);
+    EXPECT_EQ(requests[1].body(), "Email=" + std::string(4089, 'u')); // cut at 4095
+}
+
+TEST_F(AccountTest, TokenRefreshPostsTheGrantWithoutUserAgent)
+{
+    const Answer a = refresh("refresh-1");
+    EXPECT_EQ(a.result, 0);
+    EXPECT_EQ(a.resp_type, ZV_RESP_TYPE_GET_TOKEN);
+    EXPECT_EQ(a.value, ISSUED_TOKEN);
+    const Answer cut = refresh(std::string(1100, 'r')); // loses its grant_type: refused
+    EXPECT_EQ(cut.result, -999);
+    EXPECT_EQ(cut.http_code, 400);
+    EXPECT_EQ(cut.value, std::nullopt);
+
+    const auto requests = server_->requests();
+    ASSERT_EQ(requests.size(), 2u);
+    EXPECT_EQ(requests[0].get("scheme") + " " + requests[0].get("method") + " " +
+                  requests[0].get("target"),
+              "https POST /o/oauth2/token");
+    const std::string prefix = "client_id=client-1&client_secret=secret-1&refresh_token=";
+    EXPECT_EQ(requests[0].body(), prefix + "refresh-1&grant_type=refresh_token");
+    EXPECT_EQ(requests[0].header("User-Agent"), std::nullopt);
+    EXPECT_EQ(requests[1].body(), prefix + std::string(1023 - prefix.size(), 'r'));
+}
+
+TEST_F(AccountTest, TokenRefreshWithoutClientKeysQueuesNothing)
+{
+    Handle h(&inbox_);
+    zv_set_attr_refresh_token(h.h, "refresh-1");
+    for (const char *missing : {"zuvo.tizen.client.secret", "zuvo.tizen.client.id"}) {
+        ASSERT_EQ(unlink(tmp_.file(std::string("keys/") + missing).c_str()), 0);
+        EXPECT_EQ(zv_request_get_token(h.h), ZV_ERROR_KEY_STORAGE) << missing;
+    }
+    EXPECT_EQ(errors(), (std::vector<std::string>{"key_storage_get fail", "key_storage_get fail"}));
+    EXPECT_TRUE(server_->requests().empty());
+}
+
+} // namespace
