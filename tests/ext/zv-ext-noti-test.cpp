@@ -1,0 +1,241 @@
+// Tests of the system notifications on real tray files: what each call leaves in the tray,
+// a notification found again by its tag from another process, unreadable tray files, the
+// status message log and the zv-noti listing.
+#include "zv-ext-noti.h"
+
+#include <glib.h>
+#include <gtest/gtest.h>
+#include <stdlib.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <map>
+#include <string>
+
+#include "zv-test-util.h"
+
+namespace
+{
+
+class LogFile
+{
+  public:
+    // Keeps a log file named by the environment; else uses (and later removes) its own.
+    LogFile()
+    {
+        const char *env = getenv("ZV_DLOG_FILE");
+        if (env && *env) {
+            path_ = env;
+            return;
+        }
+        char tmpl[] = "/tmp/zv-noti-test-log-XXXXXX";
+        int fd = mkstemp(tmpl);
+        if (fd >= 0)
+            close(fd);
+        path_ = tmpl;
+        owned_ = true;
+        setenv("ZV_DLOG_FILE", path_.c_str(), 1);
+    }
+    ~LogFile()
+    {
+        if (owned_)
+            unlink(path_.c_str());
+    }
+    void mark() { mark_ = zv_test::read_file(path_).size(); }
+    bool logged(const std::string &text) const
+    {
+        std::string all = zv_test::read_file(path_);
+        return all.size() > mark_ && all.find(text, mark_) != std::string::npos;
+    }
+
+  private:
+    std::string path_;
+    size_t mark_ = 0;
+    bool owned_ = false;
+};
+
+LogFile g_log;
+
+const char kOngoing[] = "zuvo_ongoing_noti";
+const char kComplete[] = "zuvo_complete_noti";
+
+using Keys = std::map<std::string, std::string>;
+
+class NotiTest : public ::testing::Test
+{
+  protected:
+    void SetUp() override { g_log.mark(); }
+    void TearDown() override { zuvo_ext_noti_complete_noti_destroy(); }
+
+    std::string tray_file(const std::string &tag) const
+    {
+        return dir_.file("run/notifications/" + tag + ".ini");
+    }
+    bool posted(const std::string &tag) const { return access(tray_file(tag).c_str(), F_OK) == 0; }
+    // The keys of a posted notification; empty when it is not posted.
+    Keys keys(const std::string &tag) const
+    {
+        Keys result;
+        GKeyFile *kf = g_key_file_new();
+        if (g_key_file_load_from_file(kf, tray_file(tag).c_str(), G_KEY_FILE_NONE, nullptr)) {
+            gsize n = 0;
+            gchar **names = g_key_file_get_keys(kf, "notification", &n, nullptr);
+            for (gsize i = 0; i < n; i++) {
+                gchar *value = g_key_file_get_value(kf, "notification", names[i], nullptr);
+                result[names[i]] = value ? value : "";
+                g_free(value);
+            }
+            g_strfreev(names);
+        }
+        g_key_file_free(kf);
+        return result;
+    }
+
+    zv_test::TempDir dir_;
+};
+
+TEST_F(NotiTest, OngoingCreateWritesCountProgressAndLaunchTarget)
+{
+    struct Case {
+        int current, total;
+        double progress;
+        const char *count;
+        const char *progress_key; // nullptr: never set
+    };
+    const Case cases[] = {
+        {1, 3, 0.0, "[1/3]", "0"},
+        {1, 1, 0.5, "", "0.5"},
+        {0, 0, -1.0, "", nullptr},
+    };
+    for (const Case &c : cases) {
+        SCOPED_TRACE(c.count);
+        ASSERT_EQ(zuvo_ext_noti_ongoing_noti_create("Uploading", "clip.mp4", c.current, c.total,
+                                                    c.progress),
+                  1);
+        Keys k = keys(kOngoing);
+        EXPECT_EQ(k["type"], "ongoing");
+        EXPECT_EQ(k["title"], "Uploading");
+        EXPECT_EQ(k["content"], "clip.mp4");
+        EXPECT_EQ(k["event_count"], c.count);
+        EXPECT_EQ(k.count("progress"), c.progress_key ? 1u : 0u);
+        if (c.progress_key) {
+            EXPECT_DOUBLE_EQ(g_ascii_strtod(k["progress"].c_str(), nullptr),
+                             g_ascii_strtod(c.progress_key, nullptr));
+        }
+        EXPECT_EQ(k["display_applist"], "11");
+        EXPECT_EQ(k["tag"], kOngoing);
+        EXPECT_EQ(k["launch_app_id"], "zuvo-upload-svc");
+        EXPECT_EQ(k["disable_app_launch"], "false");
+    }
+    EXPECT_FALSE(zuvo_ext_noti_ongoing_noti_create(nullptr, "x", 0, 0, 0.0));
+    EXPECT_TRUE(g_log.logged("title_text is NULL"));
+    EXPECT_FALSE(zuvo_ext_noti_ongoing_noti_create("x", nullptr, 0, 0, 0.0));
+    EXPECT_TRUE(g_log.logged("sub_txt is NULL"));
+}
+
+TEST_F(NotiTest, UpdateRewritesOrCreatesWhenAbsent)
+{
+    zuvo_ext_noti_ongoing_noti_update("Uploading", "a.mp4", 0, 2, 0.25);
+    EXPECT_TRUE(g_log.logged("ongoing_noti_h is NULL. So, create it."));
+    EXPECT_EQ(keys(kOngoing)["display_applist"], "11");
+
+    // A negative progress keeps what the notification had.
+    zuvo_ext_noti_ongoing_noti_update("Uploading", "b.mp4", 1, 2, -1.0);
+    Keys k = keys(kOngoing);
+    EXPECT_EQ(k["content"], "b.mp4");
+    EXPECT_EQ(k["event_count"], "[1/2]");
+    EXPECT_EQ(k["display_applist"], "1");
+    EXPECT_DOUBLE_EQ(g_ascii_strtod(k["progress"].c_str(), nullptr), 0.25);
+}
+
+TEST_F(NotiTest, OngoingPostedByOneProcessIsUpdatedAndRemovedByAnother)
+{
+    pid_t pid = fork();
+    ASSERT_GE(pid, 0);
+    if (pid == 0)
+        _exit(zuvo_ext_noti_ongoing_noti_create("Uploading", "first.mp4", 0, 1, 0.1) ? 0 : 1);
+    int status = 0;
+    ASSERT_EQ(waitpid(pid, &status, 0), pid);
+    ASSERT_TRUE(WIFEXITED(status) && WEXITSTATUS(status) == 0);
+    ASSERT_TRUE(posted(kOngoing));
+
+    zuvo_ext_noti_ongoing_noti_update("Uploading", "second.mp4", 0, 1, 0.6);
+    EXPECT_FALSE(g_log.logged("So, create it."));
+    EXPECT_EQ(keys(kOngoing)["content"], "second.mp4");
+
+    std::string listing;
+    ASSERT_EQ(zv_test::run_program({zv_test::bin_path("zv-noti"), "list"}, "", &listing), 0);
+    EXPECT_NE(listing.find(std::string("[") + kOngoing + "]"), std::string::npos) << listing;
+    EXPECT_NE(listing.find("content=second.mp4"), std::string::npos) << listing;
+
+    zuvo_ext_noti_ongoing_noti_destroy();
+    EXPECT_FALSE(posted(kOngoing));
+    g_log.mark();
+    zuvo_ext_noti_ongoing_noti_destroy();
+    EXPECT_TRUE(g_log.logged("\033[32m[TID:"));
+    EXPECT_TRUE(g_log.logged("Zuvo Noti Ongoing Tag is not existed. ==="));
+}
+
+TEST_F(NotiTest, UnreadableTrayFileIsTakenAsAbsentAndLogged)
+{
+    ASSERT_TRUE(zuvo_ext_noti_ongoing_noti_create("Uploading", "a.mp4", 0, 1, 0.0));
+    const char *broken[] = {"not a key file at all [[[\n",
+                            "[notification]\ntype=ongoing\ndisplay_applist=lots\n",
+                            "[other]\ntype=noti\n"};
+    for (const char *text : broken) {
+        SCOPED_TRACE(text);
+        ASSERT_TRUE(zv_test::write_file(tray_file(kOngoing), text));
+        g_log.mark();
+        zuvo_ext_noti_ongoing_noti_update("Uploading", "b.mp4", 0, 1, 0.5);
+        EXPECT_TRUE(g_log.logged("is not a notification"));
+        EXPECT_TRUE(g_log.logged("ongoing_noti_h is NULL. So, create it."));
+        EXPECT_EQ(keys(kOngoing)["content"], "b.mp4");
+    }
+}
+
+TEST_F(NotiTest, CompletionReplacesOngoingAndOpensNothing)
+{
+    ASSERT_TRUE(zuvo_ext_noti_ongoing_noti_create("Uploading", "a.mp4", 1, 2, 0.5));
+    ASSERT_EQ(zuvo_ext_noti_complete_noti_create("Uploaded", "2 files"), 1);
+    EXPECT_FALSE(posted(kOngoing));
+    Keys k = keys(kComplete);
+    EXPECT_EQ(k["type"], "noti");
+    EXPECT_EQ(k["title"], "Uploaded");
+    EXPECT_EQ(k["content"], "2 files");
+    EXPECT_EQ(k["display_applist"], "11");
+    EXPECT_EQ(k["disable_app_launch"], "true");
+    EXPECT_EQ(k.count("launch_app_id"), 0u);
+    EXPECT_EQ(k.count("progress"), 0u);
+    EXPECT_GT(g_ascii_strtoll(k["time"].c_str(), nullptr, 10), 0);
+
+    // Destroy releases the handle only: the notification stays in the tray.
+    zuvo_ext_noti_complete_noti_destroy();
+    EXPECT_TRUE(posted(kComplete));
+    g_log.mark();
+    zuvo_ext_noti_complete_noti_destroy();
+    EXPECT_TRUE(g_log.logged("noti handle is NULL"));
+}
+
+TEST_F(NotiTest, StatusMessagesAreAppendedOneALine)
+{
+    zuvo_ext_noti_message_post("first");
+    zuvo_ext_noti_message_post("second\nline");
+    EXPECT_EQ(zv_test::read_file(dir_.file("run/notifications/status-messages.log")),
+              "first\nsecond line\n");
+}
+
+TEST_F(NotiTest, ZvNotiRejectsWrongCalls)
+{
+    const std::string noti = zv_test::bin_path("zv-noti");
+    EXPECT_EQ(zv_test::run_program({noti}), 2);
+    EXPECT_EQ(zv_test::run_program({noti, "show"}), 2);
+    EXPECT_EQ(zv_test::run_program({noti, "list", "extra"}), 2);
+    std::string help;
+    EXPECT_EQ(zv_test::run_program({noti, "--help"}, "", &help), 0);
+    EXPECT_NE(help.find("zv-noti list"), std::string::npos);
+    std::string empty;
+    EXPECT_EQ(zv_test::run_program({noti, "list"}, "", &empty), 0);
+    EXPECT_EQ(empty, "");
+}
+
+} // namespace
