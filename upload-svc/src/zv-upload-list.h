@@ -33,3 +33,14 @@ struct UploadItem {
     double date;
     AppData *ad;
 };
+
+// Job loaders (main loop; a null ad logs "resp data is NULL"). Each row becomes a job
+// prepended to ad->job_list, so the newest job stands first; a READY row is stored as
+// WAITING first. The full load takes every row (completed ones included), the ready load
+// only the rows recorded since.
+void zv_upload_list_load_full_item(AppData *ad);
+void zv_upload_list_load_ready_item(AppData *ad);
+// Shutdown write-back: every WAITING row becomes READY, every UPLOADING row PAUSED.
+void zv_upload_list_reset_full_item(AppData *ad);
+// Stores the job: writes its percent, status and url into its history row.
+void zv_upload_list_store_item(const UploadItem *job_item);

@@ -1,0 +1,314 @@
+// End-to-end tests of the service process: the real zuvo-upload-svc (headless) uploads the
+// rows the companion client records to the development server, is killed or terminated in
+// the middle, is launched again, and meets the failures of the server and of its settings.
+#include <gtest/gtest.h>
+#include <signal.h>
+#include <sys/stat.h>
+#include <sys/wait.h>
+
+#include <map>
+#include <memory>
+#include <string>
+#include <vector>
+
+#include "../upload-svc/zv-upload-test-util.h"
+#include "zv-e2e-util.h"
+#include "zv-ext-db.h"
+
+namespace
+{
+
+using zv_e2e::Child;
+using zv_e2e::DevServer;
+using zv_e2e::LoggedRequest;
+using zv_e2e::Upload;
+using zv_upload_test::notification;
+using zv_upload_test::stored_rows;
+
+constexpr int kLongWaitMs = 60000;
+
+const zv_e2e::Env kBatch = {{"ZV_DATA_ACCESS_TOKEN", "dev-token"},
+                            {"ZV_DATA_CATEGORY", "People"},
+                            {"ZV_DATA_ACCESS_TYPE", "0"}};
+
+class ServiceE2ETest : public ::testing::Test
+{
+  protected:
+    void SetUp() override
+    {
+        ASSERT_TRUE(zv_e2e::set_network(true));
+        ASSERT_TRUE(zv_e2e::set_api_key("dev-key"));
+        ASSERT_TRUE(zv_ext_db_open());
+    }
+    void TearDown() override
+    {
+        for (auto &svc : services_) {
+            svc->signal(SIGTERM);
+            svc->wait_exit(kLongWaitMs);
+        }
+        zv_ext_db_close();
+    }
+
+    bool start_server(const std::vector<std::string> &faults = {})
+    {
+        std::vector<std::string> args;
+        for (const auto &f : faults) {
+            args.push_back("--fault");
+            args.push_back(f);
+        }
+        return server_.start(dir_.path(), args);
+    }
+    // Starts a service process with these launch extras; its log goes to svc.log.
+    Child &start_service(const zv_e2e::Env &extras = kBatch)
+    {
+        services_.push_back(std::make_unique<Child>());
+        Child &svc = *services_.back();
+        std::vector<std::string> argv = {zv_test::bin_path("zuvo-upload-svc")};
+        for (const auto &kv : extras) {
+            argv.push_back("--extra");
+            argv.push_back(kv.first + "=" + kv.second);
+        }
+        zv_e2e::Env env = server_.env();
+        env.push_back({"ZV_DLOG_FILE", log_path()});
+        EXPECT_TRUE(svc.start(argv, dir_.file("svc.out"), env));
+        return svc;
+    }
+    std::string log_path() const { return dir_.file("svc.log"); }
+    bool logged(const std::string &text) const
+    {
+        return zv_test::read_file(log_path()).find(text) != std::string::npos;
+    }
+    std::string video(const std::string &name, size_t bytes, unsigned seed)
+    {
+        std::string path = dir_.file(name);
+        contents_[path] = zv_e2e::make_video(path, bytes, seed);
+        return path;
+    }
+    bool wait_status(int historyid, int status, int timeout_ms = kLongWaitMs)
+    {
+        return zv_test::wait_for([&] { return stored_rows()[historyid].status == status; },
+                                 timeout_ms);
+    }
+    // The server's upload of the row, once the row has its upload address.
+    Upload upload_of(int historyid) { return server_.upload_of_url(stored_rows()[historyid].url); }
+    bool mid_upload(int historyid)
+    {
+        Upload u = upload_of(historyid);
+        return u.held > 0 && !u.complete;
+    }
+    void expect_identical(int historyid, const std::string &file)
+    {
+        Upload u = upload_of(historyid);
+        ASSERT_TRUE(u.complete) << "upload of " << historyid;
+        EXPECT_TRUE(zv_test::read_file(u.path) == contents_[file]) << "bytes of " << file;
+    }
+
+    zv_test::TempDir dir_;
+    DevServer server_;
+    std::vector<std::unique_ptr<Child>> services_;
+    std::map<std::string, std::string> contents_;
+};
+
+TEST_F(ServiceE2ETest, TwoRecordedFilesUploadSideBySide)
+{
+    ASSERT_TRUE(start_server({"kind=data,action=throttle,rate=1000000,times=0"}));
+    std::string a = video("a.mp4", 2500000, 1);
+    std::string b = video("b.mp4", 2000000, 2);
+    std::vector<int> ids = zv_e2e::record({a, b}, "Holiday");
+    ASSERT_EQ(ids.size(), 2u);
+    Child &svc = start_service();
+
+    EXPECT_TRUE(
+        zv_test::wait_for([&] { return mid_upload(ids[0]) && mid_upload(ids[1]); }, kLongWaitMs))
+        << "both files are on their way at once";
+    ASSERT_TRUE(wait_status(ids[0], ZV_UPLOAD_STATUS_COMPLETED));
+    ASSERT_TRUE(wait_status(ids[1], ZV_UPLOAD_STATUS_COMPLETED));
+
+    auto rows = stored_rows();
+    for (size_t i = 0; i < ids.size(); i++) {
+        const auto &row = rows[ids[i]];
+        EXPECT_EQ(row.percent, 100);
+        EXPECT_EQ(row.url, upload_of(ids[i]).url);
+        EXPECT_NE(row.url.find("/resumable/uploads/"), std::string::npos);
+    }
+    expect_identical(ids[0], a);
+    expect_identical(ids[1], b);
+
+    std::string run = dir_.file("run");
+    ASSERT_TRUE(zv_test::wait_for([&] { return notification(run, "zuvo_ongoing_noti").empty(); },
+                                  kLongWaitMs));
+    auto complete = notification(run, "zuvo_complete_noti");
+    ASSERT_FALSE(complete.empty());
+    EXPECT_NE(complete["title"].find('2'), std::string::npos) << complete["title"];
+    EXPECT_FALSE(complete["content"].empty());
+
+    svc.signal(SIGTERM);
+    int status = 0;
+    ASSERT_TRUE(svc.wait_exit(kLongWaitMs, &status));
+    EXPECT_TRUE(WIFEXITED(status) && WEXITSTATUS(status) == 0);
+}
+
+TEST_F(ServiceE2ETest, KilledMidUploadResumesWithStatusQueryAtNextStart)
+{
+    ASSERT_TRUE(start_server({"kind=data,action=throttle,rate=300000,times=0"}));
+    std::string file = video("long.mp4", 3000000, 3);
+    int id = zv_e2e::record({file}, "Long").at(0);
+    Child &first = start_service();
+    ASSERT_TRUE(zv_test::wait_for([&] { return upload_of(id).held > 200000; }, kLongWaitMs));
+    ASSERT_FALSE(upload_of(id).complete);
+    first.signal(SIGKILL);
+    ASSERT_TRUE(first.wait_exit(kLongWaitMs));
+    EXPECT_EQ(stored_rows()[id].status, ZV_UPLOAD_STATUS_UPLOADING);
+
+    ASSERT_TRUE(server_.clear_faults());
+    start_service();
+    ASSERT_TRUE(wait_status(id, ZV_UPLOAD_STATUS_COMPLETED));
+    expect_identical(id, file);
+
+    // The restart sent one status query, then one data upload of the bytes the server lacked
+    // (the server refuses with 416 a range that does not start at its byte count).
+    std::vector<LoggedRequest> queries, resumed;
+    for (const LoggedRequest &r : server_.requests_of(upload_of(id).id)) {
+        EXPECT_NE(r.status, 416) << "a data upload sent bytes the server held";
+        if (r.kind == "status")
+            queries.push_back(r);
+        if (r.kind == "data" && r.range_start() > 0)
+            resumed.push_back(r);
+    }
+    ASSERT_EQ(queries.size(), 1u);
+    ASSERT_EQ(resumed.size(), 1u);
+    EXPECT_GT(resumed[0].seq, queries[0].seq);
+    EXPECT_EQ(resumed[0].status, 201);
+    EXPECT_EQ(resumed[0].range_start() + resumed[0].body_length, 3000000);
+}
+
+TEST_F(ServiceE2ETest, TerminatedMidUploadWritesRowsBack)
+{
+    // The metadata upload of the row that a second launch brings in stalls, so that row is
+    // still waiting when the service is terminated.
+    ASSERT_TRUE(start_server({"kind=data,action=throttle,rate=300000,times=0",
+                              "kind=meta,action=stall,seconds=60,nth=2"}));
+    int uploading = zv_e2e::record({video("up.mp4", 3000000, 4)}, "Uploading").at(0);
+    Child &svc = start_service();
+    ASSERT_TRUE(zv_test::wait_for([&] { return mid_upload(uploading); }, kLongWaitMs));
+    int waiting = zv_e2e::record({video("wait.mp4", 1000000, 5)}, "Waiting").at(0);
+    Child &launcher = start_service();
+    ASSERT_TRUE(launcher.wait_exit(kLongWaitMs));
+    ASSERT_TRUE(wait_status(waiting, ZV_UPLOAD_STATUS_WAITING));
+    ASSERT_TRUE(zv_test::wait_for([&] { return server_.fired("stall") == 1; }, kLongWaitMs))
+        << "the second metadata upload reached the server";
+    EXPECT_EQ(stored_rows()[uploading].status, ZV_UPLOAD_STATUS_UPLOADING);
+
+    svc.signal(SIGTERM);
+    int status = 0;
+    ASSERT_TRUE(svc.wait_exit(kLongWaitMs, &status));
+    EXPECT_TRUE(WIFEXITED(status) && WEXITSTATUS(status) == 0);
+    auto rows = stored_rows();
+    EXPECT_EQ(rows[uploading].status, ZV_UPLOAD_STATUS_PAUSED);
+    EXPECT_EQ(rows[waiting].status, ZV_UPLOAD_STATUS_READY);
+    EXPECT_TRUE(notification(dir_.file("run"), "zuvo_ongoing_noti").empty());
+}
+
+TEST_F(ServiceE2ETest, SecondLaunchAddsNewRowsWhileUploadsRun)
+{
+    ASSERT_TRUE(start_server({"kind=data,action=throttle,rate=500000,times=1"}));
+    std::string first_file = video("first.mp4", 3000000, 6);
+    int first = zv_e2e::record({first_file}, "First").at(0);
+    start_service();
+    ASSERT_TRUE(zv_test::wait_for([&] { return mid_upload(first); }, kLongWaitMs));
+
+    std::string second_file = video("second.mp4", 500000, 7);
+    int second = zv_e2e::record({second_file}, "Second").at(0);
+    Child &launcher = start_service();
+    int status = 0;
+    ASSERT_TRUE(launcher.wait_exit(kLongWaitMs, &status));
+    EXPECT_TRUE(WIFEXITED(status) && WEXITSTATUS(status) == 0) << "handed to the instance";
+
+    ASSERT_TRUE(wait_status(second, ZV_UPLOAD_STATUS_COMPLETED));
+    ASSERT_TRUE(wait_status(first, ZV_UPLOAD_STATUS_COMPLETED));
+    expect_identical(first, first_file);
+    expect_identical(second, second_file);
+    int data_requests = 0;
+    for (const LoggedRequest &r : server_.requests_of(upload_of(first).id))
+        data_requests += r.kind == "data";
+    EXPECT_EQ(data_requests, 1) << "the running upload went on undisturbed";
+}
+
+// A failure of the server or of the settings: the row ends as expected and the log says why.
+struct FailureCase {
+    const char *name;
+    const char *fault; // fault rule of the server, or null
+    bool api_key;      // the API key is in key storage
+    bool network;      // the network keys say Wi-Fi
+    bool access_type;  // the launch carries ZV_DATA_ACCESS_TYPE
+    int status;        // the row's status at the end
+    const char *message;
+    const char *also;   // a second message, or null
+    bool sends_nothing; // the server sees no request
+};
+
+void PrintTo(const FailureCase &c, std::ostream *os)
+{
+    *os << c.name;
+}
+
+class ServiceFailureTest : public ServiceE2ETest, public ::testing::WithParamInterface<FailureCase>
+{
+};
+
+TEST_P(ServiceFailureTest, RowEndsAsExpectedWithItsMessage)
+{
+    const FailureCase &c = GetParam();
+    std::vector<std::string> faults;
+    if (c.fault)
+        faults.push_back(c.fault);
+    ASSERT_TRUE(start_server(faults));
+    if (!c.api_key) {
+        ASSERT_EQ(unlink(dir_.file("keys/zuvo.tizen.api.key").c_str()), 0);
+    }
+    if (!c.network) {
+        ASSERT_TRUE(zv_e2e::set_network(false));
+    }
+    int id = zv_e2e::record({video("clip.mp4", 100000, 8)}, "Clip").at(0);
+    zv_e2e::Env extras = kBatch;
+    if (!c.access_type)
+        extras.pop_back();
+    start_service(extras);
+
+    if (c.status == ZV_UPLOAD_STATUS_WAITING) {
+        // The launch request has run once the ongoing notification is up.
+        ASSERT_TRUE(zv_test::wait_for(
+            [&] { return !notification(dir_.file("run"), "zuvo_ongoing_noti").empty(); },
+            kLongWaitMs));
+    } else {
+        ASSERT_TRUE(wait_status(id, c.status));
+    }
+    ASSERT_TRUE(zv_test::wait_for([&] { return logged(c.message); }, kLongWaitMs)) << c.message;
+    EXPECT_EQ(stored_rows()[id].status, c.status);
+    if (c.also) {
+        EXPECT_TRUE(logged(c.also)) << c.also;
+    }
+    if (c.sends_nothing) {
+        EXPECT_TRUE(server_.requests().empty());
+    }
+}
+
+const FailureCase kFailures[] = {
+    {"Http500OnDataUpload", "kind=data,action=status,status=500", true, true, true,
+     ZV_UPLOAD_STATUS_PAUSED, "HTTP RESULT : 500", nullptr, false},
+    {"MetadataAnswerWithoutLocation", "kind=meta,action=nolocation", true, true, true,
+     ZV_UPLOAD_STATUS_PAUSED, "META UPLOAD FAIL : Clip", nullptr, false},
+    {"MissingApiKey", nullptr, false, true, true, ZV_UPLOAD_STATUS_PAUSED,
+     "zv_request_meta_upload fail: -982", nullptr, true},
+    {"NoNetworkAtLaunch", nullptr, true, false, true, ZV_UPLOAD_STATUS_WAITING, "NETWORK_OFF",
+     nullptr, true},
+    {"LaunchWithoutAccessType", nullptr, true, true, false, ZV_UPLOAD_STATUS_PAUSED,
+     "zv_set_attr_token fail: -994", "get bundle value fail", true},
+};
+
+INSTANTIATE_TEST_SUITE_P(Failures, ServiceFailureTest, ::testing::ValuesIn(kFailures),
+                         [](const ::testing::TestParamInfo<FailureCase> &info) {
+                             return std::string(info.param.name);
+                         });
+
+} // namespace

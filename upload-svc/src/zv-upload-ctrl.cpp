@@ -1,0 +1,1054 @@
+// Upload controller: job intake, the two-phase upload of each job, pause and resume,
+// network changes, the pipes from the transfer worker to the main loop, and the batch
+// notifications. Threads: see zv-upload-ctrl.h.
+#include "zv-upload-ctrl.h"
+
+#include <assert.h>
+#include <errno.h>
+#include <fcntl.h>
+#include <libintl.h>
+#include <limits.h>
+#include <locale.h>
+#include <string.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <mutex>
+#include <string>
+#include <unordered_map>
+
+#include "app_i18n.h"
+#include "zv-ext-db.h"
+#include "zv-ext-location.h"
+#include "zv-ext-media.h"
+#include "zv-ext-network.h"
+#include "zv-ext-noti.h"
+#include "zv-ext-util.h"
+#include "zv-log.h"
+#include "zv-upload-list.h"
+#include "zv-upload-view.h"
+
+namespace
+{
+
+enum PipeKind { PIPE_UPLOAD, PIPE_PROGRESS, PIPE_CHANGE, PIPE_COMPLETE, PIPE_COUNT };
+
+struct CtrlPipe {
+    Ecore_Pipe *pipe = nullptr;
+    // ecore_pipe_write frames a message with two writes, and the change pipe has writers on
+    // both threads; the lock also keeps a write from meeting the pipe's deletion.
+    std::mutex write_lock;
+};
+
+// What the transfer worker may see of one job: it writes the job's new values here, and
+// the main loop copies them into the UploadItem when it handles the message that follows.
+struct WorkerView {
+    int historyid = 0;
+    const ServiceRequest *handle = nullptr; // the job's request in flight
+    int status = 0;
+    int percent = 0;
+    int offset = 0;
+    bool has_url = false;
+    std::string url;
+    std::string title;
+};
+
+struct CtrlState {
+    CtrlPipe pipes[PIPE_COUNT];
+    std::mutex lock; // guards views; held briefly, never across a call into the client
+    std::unordered_map<const UploadItem *, WorkerView> views;
+    std::unordered_map<UploadItem *, Ecore_Idler *> idlers; // main loop only
+};
+
+CtrlState g_ctrl;
+
+// A pipe can hold this many bytes of unread messages before the worker blocks on it.
+constexpr int kPipeBufferBytes = 1 << 20;
+constexpr off_t kMaxFileSize = 2147483647; // sizes travel as signed 32-bit ints
+
+const char *text(const char *msgid)
+{
+    return dcgettext(ZV_TEXT_DOMAIN, msgid, LC_MESSAGES);
+}
+
+void post_message(PipeKind kind, int historyid)
+{
+    PipeMessage msg = {historyid, 0};
+    CtrlPipe &p = g_ctrl.pipes[kind];
+    std::lock_guard<std::mutex> guard(p.write_lock);
+    if (!p.pipe) {
+        ZV_LOGE("pipe %d is closed, message of %d dropped", (int)kind, historyid);
+        return;
+    }
+    if (!ecore_pipe_write(p.pipe, &msg, sizeof msg))
+        ZV_LOGE("ecore_pipe_write fail : %d", historyid);
+}
+
+void open_pipe(PipeKind kind, Ecore_Pipe_Cb handler, AppData *ad)
+{
+    CtrlPipe &p = g_ctrl.pipes[kind];
+    std::lock_guard<std::mutex> guard(p.write_lock);
+    if (p.pipe)
+        ecore_pipe_del(p.pipe);
+    p.pipe = ecore_pipe_add(handler, ad);
+    if (!p.pipe) {
+        ZV_LOGE("ecore_pipe_add fail : %d", (int)kind);
+        return;
+    }
+    // Best effort: a larger buffer keeps a burst of progress reports from stalling the
+    // worker while the main loop is busy.
+    int fd = ecore_pipe_write_fd(p.pipe);
+    if (fd >= 0)
+        fcntl(fd, F_SETPIPE_SZ, kPipeBufferBytes);
+}
+
+void close_pipe(PipeKind kind)
+{
+    CtrlPipe &p = g_ctrl.pipes[kind];
+    std::lock_guard<std::mutex> guard(p.write_lock);
+    if (p.pipe) {
+        ecore_pipe_del(p.pipe);
+        p.pipe = nullptr;
+    }
+}
+
+// Worker: the view of the job whose request is handle. g_ctrl.lock must be held.
+WorkerView *view_of_request(const ServiceRequest *handle)
+{
+    for (auto &entry : g_ctrl.views) {
+        if (entry.second.handle == handle)
+            return &entry.second;
+    }
+    return nullptr;
+}
+
+// Main loop: copies what the worker wrote for the job into the job.
+void sync_job(UploadItem *job_item)
+{
+    std::string url;
+    bool has_url = false;
+    {
+        std::lock_guard<std::mutex> guard(g_ctrl.lock);
+        auto it = g_ctrl.views.find(job_item);
+        if (it == g_ctrl.views.end())
+            return;
+        const WorkerView &v = it->second;
+        job_item->status = v.status;
+        job_item->percent = v.percent;
+        job_item->offset = v.offset;
+        has_url = v.has_url;
+        if (has_url)
+            url = v.url;
+    }
+    if (has_url && (!job_item->url || url != job_item->url)) {
+        g_free(job_item->url);
+        job_item->url = g_strdup(url.c_str());
+    }
+}
+
+// Main loop: the only way the main loop changes a job's status, so that the worker sees it.
+void set_status(UploadItem *job_item, int status)
+{
+    job_item->status = status;
+    std::lock_guard<std::mutex> guard(g_ctrl.lock);
+    auto it = g_ctrl.views.find(job_item);
+    if (it != g_ctrl.views.end())
+        it->second.status = status;
+}
+
+// Main loop: gives the job a fresh request and releases the former one; from here on the
+// worker's answers for the former request find no job.
+ServiceRequest *renew_request(UploadItem *job_item)
+{
+    ServiceRequest *former = job_item->handle;
+    ServiceRequest *fresh = zv_request_new();
+    {
+        std::lock_guard<std::mutex> guard(g_ctrl.lock);
+        auto it = g_ctrl.views.find(job_item);
+        if (it == g_ctrl.views.end()) {
+            WorkerView v;
+            v.historyid = job_item->historyid;
+            v.status = job_item->status;
+            v.percent = job_item->percent;
+            v.offset = job_item->offset;
+            v.has_url = job_item->url != nullptr;
+            if (job_item->url)
+                v.url = job_item->url;
+            if (job_item->title)
+                v.title = job_item->title;
+            it = g_ctrl.views.emplace(job_item, std::move(v)).first;
+        }
+        it->second.handle = fresh;
+    }
+    job_item->handle = fresh;
+    if (former)
+        zv_request_free(former);
+    return fresh;
+}
+
+// Main loop: forgets the job's view and releases its request.
+void release_request(UploadItem *job_item)
+{
+    {
+        std::lock_guard<std::mutex> guard(g_ctrl.lock);
+        g_ctrl.views.erase(job_item);
+    }
+    if (job_item->handle) {
+        zv_request_free(job_item->handle);
+        job_item->handle = nullptr;
+    }
+}
+
+void cancel_start_idler(UploadItem *job_item)
+{
+    auto it = g_ctrl.idlers.find(job_item);
+    if (it == g_ctrl.idlers.end())
+        return;
+    ecore_idler_del(it->second);
+    g_ctrl.idlers.erase(it);
+}
+
+void free_job_record(UploadItem *job_item)
+{
+    g_free(job_item->userid);
+    g_free(job_item->title);
+    g_free(job_item->filename);
+    g_free(job_item->thumb_path);
+    g_free(job_item->display_name);
+    g_free(job_item->url);
+    g_free(job_item);
+}
+
+// The job stops where it is: PAUSED, stored, and its badge and the notification follow.
+void pause_job(UploadItem *job_item)
+{
+    set_status(job_item, ZV_UPLOAD_STATUS_PAUSED);
+    zv_upload_list_store_item(job_item);
+    post_message(PIPE_CHANGE, job_item->historyid);
+}
+
+// The failure tail of a step of a metadata or data upload (its message already logged).
+void fail_job(UploadItem *job_item)
+{
+    int ret = zv_request_upload_cancel(job_item->handle);
+    if (ret != ZV_ERROR_NONE)
+        ZV_LOGE("zv_request_upload_cancel fail: %d", ret);
+    pause_job(job_item);
+}
+
+// Whether the job's file can be sent: present, readable, not empty and below 2 GiB.
+// Logs why not.
+bool file_is_sendable(const UploadItem *job_item)
+{
+    const char *path = job_item->filename;
+    if (!path) {
+        ZV_LOGE("file name of %d is NULL", job_item->historyid);
+        return false;
+    }
+    struct stat st;
+    if (stat(path, &st) != 0) {
+        ZV_LOGE("file of %d is missing: %s (%s)", job_item->historyid, path, strerror(errno));
+        return false;
+    }
+    if (!S_ISREG(st.st_mode)) {
+        ZV_LOGE("file of %d is not a regular file: %s", job_item->historyid, path);
+        return false;
+    }
+    int fd = open(path, O_RDONLY | O_CLOEXEC);
+    if (fd < 0) {
+        ZV_LOGE("file of %d is unreadable: %s (%s)", job_item->historyid, path, strerror(errno));
+        return false;
+    }
+    close(fd);
+    if (st.st_size == 0) {
+        ZV_LOGE("file of %d is empty: %s", job_item->historyid, path);
+        return false;
+    }
+    if (st.st_size > kMaxFileSize) {
+        ZV_LOGE("file of %d is 2 GiB or more (%lld bytes): %s", job_item->historyid,
+                (long long)st.st_size, path);
+        return false;
+    }
+    return true;
+}
+
+// The server's byte count of a status query answer: the last byte index it holds.
+int parse_offset(const char *value)
+{
+    if (!value)
+        return 0;
+    long long n = g_ascii_strtoll(value, nullptr, 10);
+    if (n < 0)
+        return 0;
+    return n > INT_MAX ? INT_MAX : (int)n;
+}
+
+// The catalogue's plural title must hold exactly one integer conversion; a translation
+// that does not is not used as a format.
+bool has_one_int_conversion(const char *fmt)
+{
+    int count = 0;
+    for (const char *p = fmt; *p; p++) {
+        if (*p != '%')
+            continue;
+        p++;
+        if (*p == '%')
+            continue;
+        while (*p && strchr("-+ #0123456789", *p))
+            p++;
+        if (*p != 'd' && *p != 'i')
+            return false;
+        count++;
+    }
+    return count == 1;
+}
+
+char *plural_title(int completed)
+{
+    const char *fmt = i18n_get_text(text("IDS_MF_BODY_PD_FILES"));
+    if (!fmt || !has_one_int_conversion(fmt))
+        return g_strdup_printf("%d", completed);
+    return g_strdup_printf(fmt, completed);
+}
+
+int uploading_rows()
+{
+    int n = zv_ext_db_get_uploading_count();
+    return n < 0 ? 0 : n;
+}
+
+// Reads a pipe message; logs and answers false for a null buffer or context.
+bool read_message(void *data, void *buf, unsigned int nbyte, int *historyid)
+{
+    if (!buf || nbyte < sizeof(PipeMessage)) {
+        ZV_LOGE("buf is NULL");
+        return false;
+    }
+    if (!data) {
+        ZV_LOGE("handle is NULL");
+        return false;
+    }
+    PipeMessage msg;
+    memcpy(&msg, buf, sizeof msg);
+    *historyid = msg.historyid;
+    return true;
+}
+
+void set_bar_value(Elm_Object_Item *item, double value)
+{
+    if (!item)
+        return;
+    Evas_Object *bar = elm_object_item_part_content_get(item, "elm.icon");
+    if (bar)
+        elm_progressbar_value_set(bar, value);
+}
+
+// Runs once for a job that a launch request starts.
+Eina_Bool start_job_cb(void *data)
+{
+    UploadItem *job_item = static_cast<UploadItem *>(data);
+    g_ctrl.idlers.erase(job_item);
+    AppData *ad = job_item->ad;
+    if (!ad)
+        return ECORE_CALLBACK_CANCEL;
+    if (job_item->status == ZV_UPLOAD_STATUS_WAITING)
+        ad->meta_data_upload(ad, job_item);
+    else if (job_item->status == ZV_UPLOAD_STATUS_UPLOADING)
+        ad->resume_upload(ad, job_item);
+    return ECORE_CALLBACK_CANCEL;
+}
+
+void pause_running_jobs(AppData *ad)
+{
+    int index = 0;
+    for (GList *l = ad->job_list; l; l = l->next, index++) {
+        UploadItem *job_item = static_cast<UploadItem *>(l->data);
+        if (!job_item) {
+            ZV_LOGI("Skip NULL item : %d", index);
+            continue;
+        }
+        sync_job(job_item);
+        if (job_item->status == ZV_UPLOAD_STATUS_UPLOADING)
+            ad->pause_upload(ad, job_item);
+    }
+}
+
+} // namespace
+
+// A step of an upload: on a non-zero result, log the step's message and run the failure
+// tail of the job in scope.
+#define ZV_CTRL_STEP(call, message)                                                                \
+    do {                                                                                           \
+        int step_ret = (call);                                                                     \
+        if (step_ret != ZV_ERROR_NONE) {                                                           \
+            ZV_LOGE(message, step_ret);                                                            \
+            fail_job(job_item);                                                                    \
+            return;                                                                                \
+        }                                                                                          \
+    } while (0)
+
+static bool _zv_upload_ctrl_service_init(void)
+{
+    if (!zv_init_service()) {
+        ZV_LOGE("zv_init_service is fail");
+        return false;
+    }
+    char *ip = zv_ext_network_get_ip();
+    char *proxy = zv_ext_network_get_proxy();
+    zv_set_netwrok_info(ip, proxy);
+    g_free(ip);
+    g_free(proxy);
+    return true;
+}
+
+static void _zv_upload_ctrl_service_deinit(void)
+{
+    zv_finalize_service();
+}
+
+// ---- Finders ----
+
+UploadItem *_zv_upload_ctrl_find_item_by_id(AppData *ad, int historyid)
+{
+    if (!ad) {
+        ZV_LOGE("userp is NULL");
+        return nullptr;
+    }
+    if (!ad->job_list) {
+        ZV_LOGE("list is NULL");
+        return nullptr;
+    }
+    int index = 0;
+    for (GList *l = ad->job_list; l; l = l->next, index++) {
+        UploadItem *job_item = static_cast<UploadItem *>(l->data);
+        if (!job_item) {
+            ZV_LOGI("Skip NULL item : %d", index);
+            continue;
+        }
+        if (job_item->historyid == historyid)
+            return job_item;
+    }
+    return nullptr;
+}
+
+UploadItem *_zv_upload_ctrl_find_item(AppData *ad, ServiceRequest *handle)
+{
+    if (!handle) {
+        ZV_LOGE("handle is NULL");
+        return nullptr;
+    }
+    if (!ad) {
+        ZV_LOGE("userp is NULL");
+        return nullptr;
+    }
+    if (!ad->job_list) {
+        ZV_LOGE("list is NULL");
+        return nullptr;
+    }
+    int index = 0;
+    for (GList *l = ad->job_list; l; l = l->next, index++) {
+        UploadItem *job_item = static_cast<UploadItem *>(l->data);
+        if (!job_item) {
+            ZV_LOGI("Skip NULL item : %d", index);
+            continue;
+        }
+        if (job_item->handle == handle)
+            return job_item;
+    }
+    return nullptr;
+}
+
+// ---- Lifetime ----
+
+void zv_upload_ctrl_initialize(AppData *ad)
+{
+    ZV_LOG_ENTER();
+    if (!ad) {
+        ZV_LOGE("handle is NULL");
+        return;
+    }
+    ad->meta_data_upload = _zv_upload_ctrl_meta_data_upload;
+    ad->data_upload = _zv_upload_ctrl_data_upload;
+    ad->pause_upload = _zv_upload_ctrl_pause_upload;
+    ad->resume_upload = _zv_upload_ctrl_resume_upload;
+    ad->delete_item = _zv_upload_ctrl_delete_item;
+    ad->exit = _zv_upload_ctrl_exit;
+
+    open_pipe(PIPE_UPLOAD, _zv_upload_ctrl_pipe_upload_cb, ad);
+    open_pipe(PIPE_PROGRESS, _zv_upload_ctrl_pipe_update_progress_cb, ad);
+    open_pipe(PIPE_CHANGE, _zv_upload_ctrl_pipe_change_cb, ad);
+    open_pipe(PIPE_COMPLETE, _zv_upload_ctrl_pipe_complete_cb, ad);
+
+    if (!zv_ext_network_register(ad, _zv_upload_ctrl_net_status_cb, _zv_upload_ctrl_net_type_cb,
+                                 _zv_upload_ctrl_net_conf_change_cb))
+        ZV_LOGE("zv_ext_network_register fail");
+
+    if (!_zv_upload_ctrl_service_init())
+        ZV_LOGE("_zuvo_ctrl_service_init fail");
+
+    zv_ext_media_init();
+    zv_upload_list_load_full_item(ad);
+    zv_ext_util_set_appdata(ad);
+}
+
+void zv_upload_ctrl_init_value(AppData *ad)
+{
+    ZV_LOG_ENTER();
+    if (!ad) {
+        ZV_LOGE("handle is NULL");
+        return;
+    }
+    ad->is_paused = false;
+    if (ad->completed_count < 1)
+        ad->completed_count = 0;
+    ad->total_count = uploading_rows() + ad->completed_count;
+}
+
+bool zv_upload_ctrl_service(AppData *ad)
+{
+    ZV_LOG_ENTER();
+    if (!ad) {
+        ZV_LOGE("handle is NULL");
+        return false;
+    }
+    zv_upload_view_destroy(ad);
+    zv_upload_list_load_ready_item(ad);
+    zv_upload_view_init(ad);
+
+    if (zv_ext_network_check()) {
+        int index = 0;
+        for (GList *l = ad->job_list; l; l = l->next, index++) {
+            UploadItem *job_item = static_cast<UploadItem *>(l->data);
+            if (!job_item) {
+                ZV_LOGI("Skip NULL item : %d", index);
+                continue;
+            }
+            job_item->ad = ad;
+            sync_job(job_item);
+            if (job_item->status != ZV_UPLOAD_STATUS_WAITING &&
+                job_item->status != ZV_UPLOAD_STATUS_UPLOADING)
+                continue;
+            // A job whose request is in flight in this process keeps running; restarting it
+            // would cancel its transfer or send its metadata a second time.
+            if (job_item->handle || g_ctrl.idlers.count(job_item))
+                continue;
+            Ecore_Idler *idler = ecore_idler_add(start_job_cb, job_item);
+            if (idler)
+                g_ctrl.idlers[job_item] = idler;
+        }
+    }
+    zv_upload_ctrl_post_notification(ad, nullptr);
+    return true;
+}
+
+void _zv_upload_ctrl_exit(AppData *ad)
+{
+    ZV_LOG_ENTER();
+    if (!ad) {
+        ZV_LOGE("handle is NULL");
+        return;
+    }
+    zv_upload_view_destroy(ad);
+    if (zv_ext_db_get_active_count() < 1) {
+        elm_exit();
+        return;
+    }
+    if (ad->win)
+        elm_win_lower(ad->win);
+    ad->is_paused = true;
+}
+
+void zv_upload_ctrl_finalize(AppData *ad)
+{
+    ZV_LOG_ENTER();
+    if (!ad) {
+        ZV_LOGE("handle is NULL");
+        return;
+    }
+    for (int kind = 0; kind < PIPE_COUNT; kind++)
+        close_pipe(static_cast<PipeKind>(kind));
+
+    zuvo_ext_noti_ongoing_noti_destroy();
+    zuvo_ext_noti_complete_noti_destroy();
+    zv_upload_list_reset_full_item(ad);
+    zv_ext_media_deinit();
+    zv_upload_view_destroy(ad);
+
+    // Every request goes while the engine still runs, so that no transfer outlives its job.
+    for (auto &entry : g_ctrl.idlers)
+        ecore_idler_del(entry.second);
+    g_ctrl.idlers.clear();
+    for (GList *l = ad->job_list; l; l = l->next) {
+        if (l->data)
+            release_request(static_cast<UploadItem *>(l->data));
+    }
+
+    _zv_upload_ctrl_service_deinit();
+    zv_ext_db_close();
+    if (ad->win) {
+        evas_object_del(ad->win);
+        ad->win = nullptr;
+    }
+
+    // The list items went with the window; only the records are left to release.
+    for (GList *l = ad->job_list; l; l = l->next) {
+        if (l->data)
+            free_job_record(static_cast<UploadItem *>(l->data));
+    }
+    g_list_free(ad->job_list);
+    ad->job_list = nullptr;
+}
+
+// ---- Upload sequence ----
+
+void _zv_upload_ctrl_meta_data_upload(AppData *ad, UploadItem *job_item)
+{
+    ZV_LOG_ENTER();
+    if (!ad) {
+        ZV_LOGE("handle is NULL");
+        return;
+    }
+    if (!job_item) {
+        ZV_LOGE("current item is NULL");
+        return;
+    }
+    if (!zv_ext_network_check())
+        return;
+    if (!job_item->title) {
+        ZV_LOGE("title of %d is NULL", job_item->historyid);
+        pause_job(job_item);
+        return;
+    }
+    if (!file_is_sendable(job_item)) {
+        pause_job(job_item);
+        return;
+    }
+
+    ServiceRequest *handle = renew_request(job_item);
+    ZV_CTRL_STEP(zv_set_callback_func(handle, _zv_upload_ctrl_resp_cb),
+                 "zv_set_callback_func fail: %d");
+    ZV_CTRL_STEP(zv_set_user_data(handle, ad), "zv_set_user_data fail: %d");
+    ZV_CTRL_STEP(zv_set_attr_token(handle, ad->access_token), "zv_set_attr_token fail: %d");
+    ZV_CTRL_STEP(zv_set_attr_title(handle, job_item->title), "zv_set_attr_title fail: %d");
+    ZV_CTRL_STEP(zv_set_attr_category(handle, ad->category), "zv_set_attr_category fail: %d");
+    ZV_CTRL_STEP(zv_set_attr_file_path(handle, job_item->filename),
+                 "zv_set_attr_file_path fail: %d");
+    ZV_CTRL_STEP(zv_set_attr_privacy(handle, ad->access_type), "zv_set_attr_privacy fail: %d");
+    if (ad->description)
+        ZV_CTRL_STEP(zv_set_attr_description(handle, ad->description),
+                     "zv_set_attr_description fail: %d");
+    if (ad->tag)
+        ZV_CTRL_STEP(zv_set_attr_keyword(handle, ad->tag), "zv_set_attr_keyword fail: %d");
+    if (ad->use_location) {
+        double latitude = 0.0;
+        double longitude = 0.0;
+        if (zv_ext_location_get_pos(&latitude, &longitude))
+            ZV_CTRL_STEP(zv_set_attr_gps(handle, latitude, longitude), "zv_set_attr_gps fail: %d");
+    }
+    ZV_CTRL_STEP(zv_request_meta_upload(handle), "zv_request_meta_upload fail: %d");
+}
+
+void _zv_upload_ctrl_data_upload(AppData *ad, UploadItem *job_item)
+{
+    ZV_LOG_ENTER();
+    if (!ad) {
+        ZV_LOGE("handle is NULL");
+        return;
+    }
+    if (!job_item) {
+        ZV_LOGE("current item is NULL");
+        return;
+    }
+    if (!file_is_sendable(job_item)) {
+        pause_job(job_item);
+        return;
+    }
+
+    ServiceRequest *handle = renew_request(job_item);
+    ZV_CTRL_STEP(zv_set_callback_func(handle, _zv_upload_ctrl_resp_cb),
+                 "zv_set_callback_func fail: %d");
+    ZV_CTRL_STEP(zv_set_progress_callback_func(handle, _zv_upload_ctrl_progress_cb),
+                 "zv_set_progress_callback_func fail: %d");
+    ZV_CTRL_STEP(zv_set_user_data(handle, ad), "zv_set_user_data fail: %d");
+    ZV_CTRL_STEP(zv_set_attr_upload_url(handle, job_item->url), "zv_set_attr_upload_url fail: %d");
+    ZV_CTRL_STEP(zv_set_attr_file_offset(handle, job_item->offset),
+                 "zv_set_attr_file_offset fail: %d");
+    ZV_CTRL_STEP(zv_set_attr_file_path(handle, job_item->filename),
+                 "zv_set_attr_file_path fail: %d");
+    ZV_CTRL_STEP(zv_request_data_upload(handle), "zv_request_data_upload fail: %d");
+}
+
+void _zv_upload_ctrl_resp_cb(int result, ServiceResponse *resp_data, void *user_data)
+{
+    ZV_LOG_ENTER();
+    if (!resp_data) {
+        ZV_LOGE("resp data is NULL");
+        return;
+    }
+    if (!user_data) {
+        ZV_LOGE("userp data is NULL");
+        return;
+    }
+    int type = resp_data->resp_type;
+    if (type != ZV_RESP_TYPE_DATA_UPLOAD && type != ZV_RESP_TYPE_META_UPLOAD &&
+        type != ZV_RESP_TYPE_UPLOAD_QUERY) {
+        ZV_LOGE("Unknown Resp type : %d - (zuvo_handle : %p)", type, (void *)resp_data->handle);
+        return;
+    }
+
+    PipeKind kind = PIPE_CHANGE;
+    int historyid = 0;
+    std::string title;
+    {
+        std::lock_guard<std::mutex> guard(g_ctrl.lock);
+        WorkerView *v = view_of_request(resp_data->handle);
+        if (!v) {
+            kind = PIPE_COUNT;
+        } else if (type == ZV_RESP_TYPE_DATA_UPLOAD) {
+            if (result == ZV_ERROR_NONE) {
+                v->status = ZV_UPLOAD_STATUS_COMPLETED;
+                kind = PIPE_COMPLETE;
+            } else {
+                v->status = ZV_UPLOAD_STATUS_PAUSED;
+                v->offset = 0;
+            }
+        } else if (type == ZV_RESP_TYPE_META_UPLOAD) {
+            if (result == ZV_ERROR_NONE && resp_data->value) {
+                v->url = resp_data->value;
+                v->has_url = true;
+                v->status = ZV_UPLOAD_STATUS_UPLOADING;
+                kind = PIPE_UPLOAD;
+            } else {
+                v->status = ZV_UPLOAD_STATUS_PAUSED;
+                v->offset = 0;
+                title = v->title;
+            }
+        } else {
+            if (result == ZV_ERROR_NONE) {
+                v->offset = parse_offset(resp_data->value);
+                v->status = ZV_UPLOAD_STATUS_WAITING;
+                kind = PIPE_UPLOAD;
+            } else {
+                v->status = ZV_UPLOAD_STATUS_PAUSED;
+            }
+        }
+        if (v)
+            historyid = v->historyid;
+    }
+
+    if (kind == PIPE_COUNT) {
+        ZV_LOGE("Not found item : %p", (void *)resp_data->handle);
+        return;
+    }
+    if (type == ZV_RESP_TYPE_DATA_UPLOAD && result != ZV_ERROR_NONE)
+        ZV_LOGI("HTTP RESULT : %ld", (long)resp_data->http_code);
+    if (type == ZV_RESP_TYPE_META_UPLOAD && kind != PIPE_UPLOAD)
+        ZV_LOGE("META UPLOAD FAIL : %s", title.c_str());
+    post_message(kind, historyid);
+}
+
+void _zv_upload_ctrl_progress_cb(ServiceRequest *handle, int percent, void *user_data)
+{
+    if (!handle) {
+        ZV_LOGE("handle is NULL");
+        return;
+    }
+    if (!user_data) {
+        ZV_LOGE("userp data is NULL");
+        return;
+    }
+    PipeKind kind = PIPE_PROGRESS;
+    int historyid = 0;
+    {
+        std::lock_guard<std::mutex> guard(g_ctrl.lock);
+        WorkerView *v = view_of_request(handle);
+        if (!v) {
+            kind = PIPE_COUNT;
+        } else {
+            historyid = v->historyid;
+            v->percent = percent < 0 ? 0 : (percent > 100 ? 100 : percent);
+            if (v->status != ZV_UPLOAD_STATUS_UPLOADING) {
+                v->status = ZV_UPLOAD_STATUS_UPLOADING;
+                kind = PIPE_CHANGE;
+            }
+        }
+    }
+    if (kind == PIPE_COUNT) {
+        ZV_LOGE("Not found item : %p", (void *)handle);
+        return;
+    }
+    post_message(kind, historyid);
+}
+
+void _zv_upload_ctrl_pipe_upload_cb(void *data, void *buf, unsigned int nbyte)
+{
+    ZV_LOG_ENTER();
+    int historyid = 0;
+    if (!read_message(data, buf, nbyte, &historyid))
+        return;
+    AppData *ad = static_cast<AppData *>(data);
+    UploadItem *job_item = _zv_upload_ctrl_find_item_by_id(ad, historyid);
+    if (!job_item) {
+        ZV_LOGE("item is NULL");
+        return;
+    }
+    sync_job(job_item);
+    zv_upload_list_store_item(job_item);
+    _zv_upload_ctrl_data_upload(ad, job_item);
+}
+
+void _zv_upload_ctrl_pipe_update_progress_cb(void *data, void *buf, unsigned int nbyte)
+{
+    int historyid = 0;
+    if (!read_message(data, buf, nbyte, &historyid))
+        return;
+    AppData *ad = static_cast<AppData *>(data);
+    UploadItem *job_item = _zv_upload_ctrl_find_item_by_id(ad, historyid);
+    if (!job_item) {
+        ZV_LOGE("%d , item is NULL", historyid);
+        return;
+    }
+    sync_job(job_item);
+    if (ad->is_paused)
+        return;
+    if (!job_item->gen_item) {
+        ZV_LOGE("%d , item->gen_item is NULL", historyid);
+        return;
+    }
+    zv_upload_list_store_item(job_item);
+    double value = job_item->percent / 100.0;
+    set_bar_value(job_item->gen_item, value);
+    set_bar_value(job_item->edit_gen_item, value);
+    if (ad->total_count == 1)
+        zv_upload_ctrl_post_notification(ad, job_item);
+}
+
+void _zv_upload_ctrl_pipe_change_cb(void *data, void *buf, unsigned int nbyte)
+{
+    ZV_LOG_ENTER();
+    int historyid = 0;
+    if (!read_message(data, buf, nbyte, &historyid))
+        return;
+    AppData *ad = static_cast<AppData *>(data);
+    UploadItem *job_item = _zv_upload_ctrl_find_item_by_id(ad, historyid);
+    if (!job_item) {
+        ZV_LOGE("item is NULL");
+        return;
+    }
+    sync_job(job_item);
+    ZV_LOGI("It maybe need to change badge button state.");
+    zv_upload_view_update_badge_button(job_item);
+    zv_upload_list_store_item(job_item);
+    ZV_LOGI("It need to update notification");
+    ad->total_count = ad->completed_count + uploading_rows();
+    zv_upload_ctrl_post_notification(ad, job_item);
+}
+
+void _zv_upload_ctrl_pipe_complete_cb(void *data, void *buf, unsigned int nbyte)
+{
+    ZV_LOG_ENTER();
+    int historyid = 0;
+    if (!read_message(data, buf, nbyte, &historyid))
+        return;
+    AppData *ad = static_cast<AppData *>(data);
+    UploadItem *job_item = _zv_upload_ctrl_find_item_by_id(ad, historyid);
+    if (!job_item) {
+        ZV_LOGE("item is NULL");
+        return;
+    }
+    sync_job(job_item);
+    zv_upload_list_store_item(job_item);
+
+    ZV_LOGI("Add current completed item count");
+    ad->completed_count++;
+    zv_upload_ctrl_post_notification(ad, job_item);
+
+    if (!ad->is_paused) {
+        zv_upload_list_complete_item(job_item);
+        if (zv_ext_db_get_active_count() <= 0)
+            ZV_LOGI("No more upload item");
+        return;
+    }
+    if (zv_ext_db_get_active_count() <= 0) {
+        ZV_LOGI("Not exist running job");
+        elm_exit();
+    }
+}
+
+// ---- Pause, resume, delete, network ----
+
+void _zv_upload_ctrl_pause_upload(AppData *ad, UploadItem *job_item)
+{
+    ZV_LOG_ENTER();
+    if (!ad) {
+        ZV_LOGE("handle is NULL");
+        return;
+    }
+    if (!job_item) {
+        ZV_LOGE("data is NULL");
+        return;
+    }
+    ZV_LOGI("%p, %d", (void *)job_item, job_item->historyid);
+    sync_job(job_item);
+    if (job_item->status == ZV_UPLOAD_STATUS_COMPLETED) {
+        ZV_LOGI("Skip for complete item");
+        return;
+    }
+    int ret = zv_request_upload_pause(job_item->handle);
+    if (ret != ZV_ERROR_NONE) {
+        ZV_LOGE("zv_request_upload_pause fail: %d", ret);
+        return;
+    }
+    pause_job(job_item);
+}
+
+void _zv_upload_ctrl_resume_upload(AppData *ad, UploadItem *job_item)
+{
+    ZV_LOG_ENTER();
+    if (!ad) {
+        ZV_LOGE("handle is NULL");
+        return;
+    }
+    if (!job_item) {
+        ZV_LOGE("data is NULL");
+        return;
+    }
+    sync_job(job_item);
+    if (job_item->status == ZV_UPLOAD_STATUS_COMPLETED) {
+        ZV_LOGI("Skip for complete item");
+        return;
+    }
+
+    ServiceRequest *handle = renew_request(job_item);
+    int ret = zv_set_callback_func(handle, _zv_upload_ctrl_resp_cb);
+    if (ret != ZV_ERROR_NONE)
+        ZV_LOGE("zv_set_callback_func fail: %d", ret);
+    if (ret == ZV_ERROR_NONE) {
+        ret = zv_set_user_data(handle, ad);
+        if (ret != ZV_ERROR_NONE)
+            ZV_LOGE("zv_set_user_data fail: %d", ret);
+    }
+    if (ret == ZV_ERROR_NONE) {
+        ret = zv_set_attr_upload_url(handle, job_item->url);
+        if (ret != ZV_ERROR_NONE)
+            ZV_LOGE("zv_set_attr_upload_url fail: %d", ret);
+    }
+    if (ret == ZV_ERROR_NONE) {
+        ret = zv_request_upload_query(handle);
+        if (ret != ZV_ERROR_NONE)
+            ZV_LOGE("zv_request_upload_query fail: %d", ret);
+    }
+
+    if (ret == ZV_ERROR_NONE) {
+        set_status(job_item, ZV_UPLOAD_STATUS_UPLOADING);
+    } else {
+        set_status(job_item, ZV_UPLOAD_STATUS_PAUSED);
+        int cancel_ret = zv_request_upload_cancel(handle);
+        if (cancel_ret != ZV_ERROR_NONE)
+            ZV_LOGE("zv_request_upload_cancel fail: %d", cancel_ret);
+    }
+    post_message(PIPE_CHANGE, job_item->historyid);
+}
+
+void _zv_upload_ctrl_delete_item(UploadItem *job_item, bool delete_from_db)
+{
+    ZV_LOGI("%p", (void *)job_item);
+    if (!job_item) {
+        ZV_LOGE("item is NULL");
+        return;
+    }
+    if (delete_from_db)
+        zv_ext_db_delete_item(job_item->historyid);
+    cancel_start_idler(job_item);
+    release_request(job_item);
+    if (job_item->check) {
+        evas_object_del(job_item->check);
+        job_item->check = nullptr;
+    }
+    if (job_item->gen_item) {
+        elm_object_item_del(job_item->gen_item);
+        job_item->gen_item = nullptr;
+    }
+    if (job_item->edit_gen_item) {
+        elm_object_item_del(job_item->edit_gen_item);
+        job_item->edit_gen_item = nullptr;
+    }
+    free_job_record(job_item);
+}
+
+void _zv_upload_ctrl_net_status_cb(int state, void *userp)
+{
+    ZV_LOGI("state : %d", state);
+    if (!userp) {
+        ZV_LOGE("resp data is NULL");
+        return;
+    }
+    pause_running_jobs(static_cast<AppData *>(userp));
+}
+
+void _zv_upload_ctrl_net_type_cb(int type, void *userp)
+{
+    ZV_LOGI("type : %d", type);
+    if (!userp) {
+        ZV_LOGE("resp data is NULL");
+        return;
+    }
+    pause_running_jobs(static_cast<AppData *>(userp));
+}
+
+void _zv_upload_ctrl_net_conf_change_cb(char *ip, char *proxy, void *userp)
+{
+    ZV_LOG_ENTER();
+    if (!userp) {
+        ZV_LOGE("resp data is NULL");
+        g_free(ip);
+        g_free(proxy);
+        return;
+    }
+    zv_set_netwrok_info(ip, proxy);
+    g_free(ip);
+    g_free(proxy);
+    pause_running_jobs(static_cast<AppData *>(userp));
+}
+
+// ---- Notifications ----
+
+void zv_upload_ctrl_post_notification(AppData *ad, UploadItem *job_item)
+{
+    ZV_LOG_ENTER();
+    if (!ad) {
+        ZV_LOGE("handle is NULL");
+        return;
+    }
+    int completed = ad->completed_count;
+    int total = ad->total_count;
+
+    if (completed >= total) {
+        ZV_LOGI("Uploading is completed. Notice.");
+        const char *content = text("IDS_DM_SBODY_UPLOADED_ABB");
+        bool names_job = total == 1 && job_item && job_item->status == ZV_UPLOAD_STATUS_COMPLETED;
+        // A failed job beside one completed job is never named as uploaded: the batch then
+        // takes the plural title with the completed count.
+        bool plural = total > 1 || (total == 1 && job_item && !names_job);
+        if (plural) {
+            char *title = plural_title(completed);
+            zuvo_ext_noti_complete_noti_create(title, content);
+            g_free(title);
+        } else if (names_job) {
+            zuvo_ext_noti_complete_noti_create(job_item->title, content);
+        }
+        zuvo_ext_noti_ongoing_noti_destroy();
+        ad->completed_count = 0;
+        return;
+    }
+
+    const char *title = text("IDS_GALLERY_TMBODY_ZUVO_ABB");
+    const char *content = text("IDS_DM_SBODY_UPLOADING_ING");
+    if (total > 1) {
+        zuvo_ext_noti_ongoing_noti_update(title, content, completed, total,
+                                          (double)completed / (double)total);
+    } else {
+        double progress = job_item ? job_item->percent / 100.0 : 0.0;
+        zuvo_ext_noti_ongoing_noti_update(title, content, completed, 1, progress);
+    }
+}
