@@ -361,7 +361,14 @@ int vconf_notify_key_changed(const char *in_key, vconf_callback_fn cb, void *use
     WatchState &st = watch_state();
     for (Watch &w : st.watches) {
         if (w.key == in_key && w.cb == cb) {
+            // The key may live in another folder since the first registration (the runtime
+            // folder moved): the watch follows it.
+            std::string old_dir = w.dir;
+            w.dir = dir.get();
+            w.name = name.get();
             w.user_data = user_data;
+            if (old_dir != w.dir)
+                unwatch_dir_if_unused(old_dir);
             return VCONF_OK;
         }
     }

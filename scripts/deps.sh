@@ -3,7 +3,7 @@ ZV_DEB_PACKAGES=(
   cmake g++ make pkg-config
   libefl-all-dev libedje-bin
   libcurl4-openssl-dev libxml2-dev libsqlite3-dev libglib2.0-dev
-  libgtest-dev libgmock-dev libcpp-httplib-dev
+  libgtest-dev libgmock-dev
   libmicrohttpd-dev libssl-dev openssl
   gettext curl xvfb xauth matchbox-window-manager
   gstreamer1.0-tools gstreamer1.0-plugins-base gstreamer1.0-plugins-good

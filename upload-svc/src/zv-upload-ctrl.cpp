@@ -408,7 +408,8 @@ static void _zv_upload_ctrl_service_deinit(void)
 
 // ---- Finders ----
 
-UploadItem *_zv_upload_ctrl_find_item_by_id(AppData *ad, int historyid)
+// The first job of the list that `matches`, skipping the empty entries.
+template <typename Match> static UploadItem *find_job(AppData *ad, Match matches)
 {
     if (!ad) {
         ZV_LOGE("userp is NULL");
@@ -425,10 +426,15 @@ UploadItem *_zv_upload_ctrl_find_item_by_id(AppData *ad, int historyid)
             ZV_LOGI("Skip NULL item : %d", index);
             continue;
         }
-        if (job_item->historyid == historyid)
+        if (matches(job_item))
             return job_item;
     }
     return nullptr;
+}
+
+UploadItem *_zv_upload_ctrl_find_item_by_id(AppData *ad, int historyid)
+{
+    return find_job(ad, [historyid](const UploadItem *job) { return job->historyid == historyid; });
 }
 
 UploadItem *_zv_upload_ctrl_find_item(AppData *ad, ServiceRequest *handle)
@@ -437,25 +443,7 @@ UploadItem *_zv_upload_ctrl_find_item(AppData *ad, ServiceRequest *handle)
         ZV_LOGE("handle is NULL");
         return nullptr;
     }
-    if (!ad) {
-        ZV_LOGE("userp is NULL");
-        return nullptr;
-    }
-    if (!ad->job_list) {
-        ZV_LOGE("list is NULL");
-        return nullptr;
-    }
-    int index = 0;
-    for (GList *l = ad->job_list; l; l = l->next, index++) {
-        UploadItem *job_item = static_cast<UploadItem *>(l->data);
-        if (!job_item) {
-            ZV_LOGI("Skip NULL item : %d", index);
-            continue;
-        }
-        if (job_item->handle == handle)
-            return job_item;
-    }
-    return nullptr;
+    return find_job(ad, [handle](const UploadItem *job) { return job->handle == handle; });
 }
 
 // ---- Lifetime ----

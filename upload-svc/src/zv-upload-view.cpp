@@ -681,16 +681,21 @@ static Evas_Object *_zv_upload_list_create_nocontent_layout(Evas_Object *parent)
     return outer;
 }
 
-static void _zv_upload_list_append_item_data(AppData *ad)
+// Appends a row for every job to a list: the progress style for the jobs under way, the
+// complete style for the completed ones. Every row starts unchecked; the job keeps its row
+// in `slot` (its upload-list row or its edit-list row).
+static void append_job_rows(AppData *ad, Evas_Object *genlist, Elm_Gen_Item_Content_Get_Cb content_get,
+                            Elm_Gen_Item_Content_Get_Cb complete_content_get, Evas_Smart_Cb select_cb,
+                            Elm_Object_Item *UploadItem::*slot)
 {
     ItcPtr itc(elm_genlist_item_class_new());
     itc->item_style = PROGRESS_STYLE;
     itc->func.text_get = __zv_upload_list_get_item_text;
-    itc->func.content_get = __zv_upload_list_get_item_content;
+    itc->func.content_get = content_get;
     ItcPtr complete_itc(elm_genlist_item_class_new());
     complete_itc->item_style = COMPLETE_STYLE;
     complete_itc->func.text_get = __zv_upload_list_get_complete_item_text;
-    complete_itc->func.content_get = __zv_upload_list_get_complete_item_content;
+    complete_itc->func.content_get = complete_content_get;
 
     int index = 0;
     for (GList *l = ad->job_list; l; l = l->next, index++) {
@@ -702,10 +707,16 @@ static void _zv_upload_list_append_item_data(AppData *ad)
         job->checked = false;
         Elm_Genlist_Item_Class *cls =
             job->status == ZV_UPLOAD_STATUS_COMPLETED ? complete_itc.get() : itc.get();
-        job->gen_item =
-            elm_genlist_item_append(ad->pGenlist, cls, job, nullptr, ELM_GENLIST_ITEM_NONE,
-                                    __zv_upload_list_item_select_cb, job);
+        job->*slot = elm_genlist_item_append(genlist, cls, job, nullptr, ELM_GENLIST_ITEM_NONE,
+                                             select_cb, job);
     }
+}
+
+static void _zv_upload_list_append_item_data(AppData *ad)
+{
+    append_job_rows(ad, ad->pGenlist, __zv_upload_list_get_item_content,
+                    __zv_upload_list_get_complete_item_content, __zv_upload_list_item_select_cb,
+                    &UploadItem::gen_item);
 }
 
 // Deletes the naviframe item that shows the list layout, and with it the layout.
@@ -964,29 +975,9 @@ static void _zv_upload_list_append_item_of_edit_mode_data(AppData *ad)
         ZV_LOGE("job_list is NULL");
         return;
     }
-    ItcPtr itc(elm_genlist_item_class_new());
-    itc->item_style = PROGRESS_STYLE;
-    itc->func.text_get = __zv_upload_list_get_item_text;
-    itc->func.content_get = __zv_upload_list_get_item_content_of_edit_mode;
-    ItcPtr complete_itc(elm_genlist_item_class_new());
-    complete_itc->item_style = COMPLETE_STYLE;
-    complete_itc->func.text_get = __zv_upload_list_get_complete_item_text;
-    complete_itc->func.content_get = __zv_upload_list_get_complete_item_content_of_edit_mode;
-
-    int index = 0;
-    for (GList *l = ad->job_list; l; l = l->next, index++) {
-        auto *job = static_cast<UploadItem *>(l->data);
-        if (!job) {
-            ZV_LOGE("%d item is NULL", index);
-            continue;
-        }
-        job->checked = false;
-        Elm_Genlist_Item_Class *cls =
-            job->status == ZV_UPLOAD_STATUS_COMPLETED ? complete_itc.get() : itc.get();
-        job->edit_gen_item =
-            elm_genlist_item_append(ad->pEditGenlist, cls, job, nullptr, ELM_GENLIST_ITEM_NONE,
-                                    __zv_upload_list_item_of_edit_mode_select_cb, job);
-    }
+    append_job_rows(ad, ad->pEditGenlist, __zv_upload_list_get_item_content_of_edit_mode,
+                    __zv_upload_list_get_complete_item_content_of_edit_mode,
+                    __zv_upload_list_item_of_edit_mode_select_cb, &UploadItem::edit_gen_item);
 }
 
 static void _zv_upload_list_edit_mode(AppData *ad)

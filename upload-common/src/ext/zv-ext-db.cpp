@@ -226,6 +226,24 @@ int load_items(GList **list, bool ready_only)
     return 1;
 }
 
+// Runs a COUNT statement: the count, 0 when the step fails, -1 when it cannot be prepared.
+int step_count(sqlite3 *db, const char *sql)
+{
+    StmtPtr stmt = prepare(db, sql);
+    if (!stmt)
+        return -1;
+    int count = 0;
+    int rc = sqlite3_step(stmt.get());
+    if (rc == SQLITE_ROW) {
+        ZV_LOGI("SQL step success");
+        count = sqlite3_column_int(stmt.get(), 0);
+    } else {
+        ZV_LOGE("SQL return: %d (%s)", rc, sqlite3_errmsg(db));
+    }
+    finalize(stmt);
+    return count;
+}
+
 // Number of rows whose status matches the condition built from where_fmt; -1 when the
 // statement cannot be prepared (or no connection is open), 0 on the other failures.
 int count_rows(const char *where_fmt, ...) G_GNUC_PRINTF(1, 2);
@@ -247,19 +265,7 @@ int count_rows(const char *where_fmt, ...)
         ZV_LOGE("g_string_append_printf() failed.");
         return 0;
     }
-    StmtPtr stmt = prepare(db, sql->str);
-    if (!stmt)
-        return -1;
-    int count = 0;
-    int rc = sqlite3_step(stmt.get());
-    if (rc == SQLITE_ROW) {
-        ZV_LOGI("SQL step success");
-        count = sqlite3_column_int(stmt.get(), 0);
-    } else {
-        ZV_LOGE("SQL return: %d (%s)", rc, sqlite3_errmsg(db));
-    }
-    finalize(stmt);
-    return count;
+    return step_count(db, sql->str);
 }
 
 } // namespace
@@ -285,19 +291,7 @@ static int _zv_ext_db_get_count(sqlite3 *db)
     GStringPtr sql = build_statement("%s", "select COUNT(*) from history");
     if (!sql)
         return 0;
-    StmtPtr stmt = prepare(db, sql->str);
-    if (!stmt)
-        return -1;
-    int count = 0;
-    int rc = sqlite3_step(stmt.get());
-    if (rc == SQLITE_ROW) {
-        ZV_LOGI("SQL step success");
-        count = sqlite3_column_int(stmt.get(), 0);
-    } else {
-        ZV_LOGE("SQL return: %d (%s)", rc, sqlite3_errmsg(db));
-    }
-    finalize(stmt);
-    return count;
+    return step_count(db, sql->str);
 }
 
 // Trim, second step: drops every completed row.
