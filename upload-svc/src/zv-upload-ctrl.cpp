@@ -768,39 +768,47 @@ void _zv_upload_ctrl_progress_cb(ServiceRequest *handle, int percent, void *user
     post_message(kind, historyid);
 }
 
+// The job a pipe message names, brought up to date with what the worker recorded; null
+// (and a log line, with the id for the progress handler) when the message is bad or the job
+// is gone.
+static UploadItem *job_of_message(AppData *ad, void *buf, unsigned int nbyte, bool log_id)
+{
+    int historyid = 0;
+    if (!read_message(ad, buf, nbyte, &historyid))
+        return nullptr;
+    UploadItem *job_item = _zv_upload_ctrl_find_item_by_id(ad, historyid);
+    if (!job_item) {
+        if (log_id)
+            ZV_LOGE("%d , item is NULL", historyid);
+        else
+            ZV_LOGE("item is NULL");
+        return nullptr;
+    }
+    sync_job(job_item);
+    return job_item;
+}
+
 void _zv_upload_ctrl_pipe_upload_cb(void *data, void *buf, unsigned int nbyte)
 {
     ZV_LOG_ENTER();
-    int historyid = 0;
-    if (!read_message(data, buf, nbyte, &historyid))
-        return;
     AppData *ad = static_cast<AppData *>(data);
-    UploadItem *job_item = _zv_upload_ctrl_find_item_by_id(ad, historyid);
-    if (!job_item) {
-        ZV_LOGE("item is NULL");
+    UploadItem *job_item = job_of_message(ad, buf, nbyte, false);
+    if (!job_item)
         return;
-    }
-    sync_job(job_item);
     zv_upload_list_store_item(job_item);
     _zv_upload_ctrl_data_upload(ad, job_item);
 }
 
 void _zv_upload_ctrl_pipe_update_progress_cb(void *data, void *buf, unsigned int nbyte)
 {
-    int historyid = 0;
-    if (!read_message(data, buf, nbyte, &historyid))
-        return;
     AppData *ad = static_cast<AppData *>(data);
-    UploadItem *job_item = _zv_upload_ctrl_find_item_by_id(ad, historyid);
-    if (!job_item) {
-        ZV_LOGE("%d , item is NULL", historyid);
+    UploadItem *job_item = job_of_message(ad, buf, nbyte, true);
+    if (!job_item)
         return;
-    }
-    sync_job(job_item);
     if (ad->is_paused)
         return;
     if (!job_item->gen_item) {
-        ZV_LOGE("%d , item->gen_item is NULL", historyid);
+        ZV_LOGE("%d , item->gen_item is NULL", job_item->historyid);
         return;
     }
     zv_upload_list_store_item(job_item);
@@ -814,16 +822,10 @@ void _zv_upload_ctrl_pipe_update_progress_cb(void *data, void *buf, unsigned int
 void _zv_upload_ctrl_pipe_change_cb(void *data, void *buf, unsigned int nbyte)
 {
     ZV_LOG_ENTER();
-    int historyid = 0;
-    if (!read_message(data, buf, nbyte, &historyid))
-        return;
     AppData *ad = static_cast<AppData *>(data);
-    UploadItem *job_item = _zv_upload_ctrl_find_item_by_id(ad, historyid);
-    if (!job_item) {
-        ZV_LOGE("item is NULL");
+    UploadItem *job_item = job_of_message(ad, buf, nbyte, false);
+    if (!job_item)
         return;
-    }
-    sync_job(job_item);
     ZV_LOGI("It maybe need to change badge button state.");
     zv_upload_view_update_badge_button(job_item);
     zv_upload_list_store_item(job_item);
@@ -835,16 +837,10 @@ void _zv_upload_ctrl_pipe_change_cb(void *data, void *buf, unsigned int nbyte)
 void _zv_upload_ctrl_pipe_complete_cb(void *data, void *buf, unsigned int nbyte)
 {
     ZV_LOG_ENTER();
-    int historyid = 0;
-    if (!read_message(data, buf, nbyte, &historyid))
-        return;
     AppData *ad = static_cast<AppData *>(data);
-    UploadItem *job_item = _zv_upload_ctrl_find_item_by_id(ad, historyid);
-    if (!job_item) {
-        ZV_LOGE("item is NULL");
+    UploadItem *job_item = job_of_message(ad, buf, nbyte, false);
+    if (!job_item)
         return;
-    }
-    sync_job(job_item);
     zv_upload_list_store_item(job_item);
 
     ZV_LOGI("Add current completed item count");
