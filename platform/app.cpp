@@ -162,6 +162,11 @@ std::string resource_dir()
     std::string dir = exe_dir();
     if (!dir.empty() && canonical(dir) == canonical(ZV_BUILD_BIN_DIR))
         return with_slash(ZV_BUILD_RES_DIR);
+    if (!dir.empty()) {
+        std::string beside = canonical(dir + "/" + ZV_BIN_TO_RES_DIR);
+        if (g_file_test(beside.c_str(), G_FILE_TEST_IS_DIR))
+            return with_slash(beside);
+    }
     return with_slash(ZV_INSTALL_RES_DIR);
 }
 
