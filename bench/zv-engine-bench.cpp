@@ -32,47 +32,13 @@
 #include <thread>
 #include <vector>
 
+#include "zv-bench-util.h"
 #include "zv-plugin-curl.h"
 
 namespace
 {
 
-using Clock = std::chrono::steady_clock;
-
-double seconds_since(Clock::time_point t)
-{
-    return std::chrono::duration<double>(Clock::now() - t).count();
-}
-
-double cpu_seconds(const rusage &ru)
-{
-    return ru.ru_utime.tv_sec + ru.ru_utime.tv_usec / 1e6 + ru.ru_stime.tv_sec +
-           ru.ru_stime.tv_usec / 1e6;
-}
-
-double self_cpu()
-{
-    rusage ru;
-    getrusage(RUSAGE_SELF, &ru);
-    return cpu_seconds(ru);
-}
-
-long rss_kib()
-{
-    FILE *f = fopen("/proc/self/status", "r");
-    if (!f)
-        return -1;
-    char line[256];
-    long kib = -1;
-    while (fgets(line, sizeof line, f)) {
-        if (strncmp(line, "VmRSS:", 6) == 0) {
-            kib = atol(line + 6);
-            break;
-        }
-    }
-    fclose(f);
-    return kib;
-}
+using namespace zv_bench;
 
 // ---- the sink server (child process) ----
 
@@ -142,178 +108,6 @@ int run_sink()
     }
 }
 
-// Starts argv as a child whose first line of output is its port.
-pid_t spawn_server(const std::vector<std::string> &argv, int *port)
-{
-    int out[2];
-    if (pipe(out) != 0)
-        return -1;
-    pid_t pid = fork();
-    if (pid == 0) {
-        dup2(out[1], STDOUT_FILENO);
-        close(out[0]);
-        close(out[1]);
-        std::vector<char *> args;
-        for (const std::string &a : argv)
-            args.push_back(const_cast<char *>(a.c_str()));
-        args.push_back(nullptr);
-        execv(args[0], args.data());
-        _exit(127);
-    }
-    close(out[1]);
-    std::string line;
-    char c;
-    while (read(out[0], &c, 1) == 1 && c != '\n')
-        line += c;
-    close(out[0]);
-    // The port is the last number on the line.
-    size_t digits = line.find_last_not_of("0123456789");
-    *port = atoi(line.c_str() + (digits == std::string::npos ? 0 : digits + 1));
-    return pid;
-}
-
-// ---- engine requests ----
-
-struct Waiter {
-    std::mutex m;
-    std::condition_variable cv;
-    bool done = false;
-    long http_code = -2;
-    std::string header;
-    std::atomic<int> reads{0};
-
-    void reset()
-    {
-        std::lock_guard<std::mutex> lock(m);
-        done = false;
-        http_code = -2;
-        header.clear();
-        reads = 0;
-    }
-    bool wait(double timeout_s)
-    {
-        std::unique_lock<std::mutex> lock(m);
-        return cv.wait_for(lock, std::chrono::duration<double>(timeout_s), [this] { return done; });
-    }
-};
-
-void on_answer(int, TransferResponse *resp, void *user_data)
-{
-    Waiter *w = static_cast<Waiter *>(user_data);
-    std::lock_guard<std::mutex> lock(w->m);
-    w->done = true;
-    w->http_code = resp->http_code;
-    if (resp->header_data)
-        w->header = resp->header_data;
-    w->cv.notify_all();
-}
-
-void on_progress(int, void *user_data, int, int)
-{
-    static_cast<Waiter *>(user_data)->reads++;
-}
-
-TransferItem *new_item(Waiter *w, int method, const std::string &url)
-{
-    TransferItem *item = nullptr;
-    zv_curl_new(&item);
-    zv_curl_set_callback_func(item, on_answer);
-    zv_curl_set_progress_cb_func(item, on_progress);
-    zv_curl_set_user_data(item, w);
-    zv_curl_set_method(item, method);
-    zv_curl_set_url(item, url.c_str());
-    zv_curl_set_connect_timeout(item, 30000);
-    return item;
-}
-
-TransferItem *new_upload(Waiter *w, const std::string &url, const std::string &path, int size)
-{
-    TransferItem *item = new_item(w, ZV_CURL_HTTP_METHOD_PUT, url);
-    std::string range =
-        "Content-Range: bytes 0-" + std::to_string(size - 1) + "/" + std::to_string(size);
-    std::string length = "Content-Length: " + std::to_string(size);
-    zv_curl_set_header(item, "Content-Type: video/mp4");
-    zv_curl_set_header(item, range.c_str());
-    zv_curl_set_header(item, "Expect:");
-    zv_curl_set_header(item, length.c_str());
-    zv_curl_set_file_info(item, path.c_str(), size, 0);
-    return item;
-}
-
-struct Target {
-    std::string base; // http://127.0.0.1:PORT
-    bool devserver = false;
-    std::string token = "bench-token";
-    std::string api_key = "bench-key";
-
-    // An address to PUT a file to: made by the metadata POST on the devserver.
-    std::string upload_url()
-    {
-        if (!devserver)
-            return base + "/upload/bench";
-        Waiter w;
-        std::string url = base + "/resumable/feeds/api/users/default/uploads";
-        TransferItem *item = new_item(&w, ZV_CURL_HTTP_METHOD_POST, url);
-        const char *doc = "<?xml version=\"1.0\"?>\r\n<entry xmlns=\"http://www.w3.org/2005/Atom\" "
-                          "xmlns:media=\"http://search.yahoo.com/mrss/\"><media:group>"
-                          "<media:title type=\"plain\">bench</media:title>"
-                          "<media:category>People</media:category></media:group></entry>";
-        std::string auth = "Authorization: Bearer " + token;
-        std::string key = "X-ZvData-Key: key=" + api_key;
-        zv_curl_set_header(item, "Content-Type: application/atom+xml; charset=UTF-8");
-        zv_curl_set_header(item, "ZvData-Version: 2");
-        zv_curl_set_header(item, auth.c_str());
-        zv_curl_set_header(item, key.c_str());
-        zv_curl_set_header(item, "Slug: bench.mp4");
-        zv_curl_set_body(item, doc, static_cast<int>(strlen(doc)));
-        zv_curl_send_request(item);
-        w.wait(30);
-        zv_curl_delete(&item);
-        size_t at = w.header.find("Location: ");
-        if (at == std::string::npos)
-            return "";
-        return w.header.substr(at + 10, w.header.find('\r', at) - at - 10);
-    }
-};
-
-// Removes the uploads a devserver stored (nothing without a storage folder).
-void drop_stored(const std::string &storage)
-{
-    if (storage.empty())
-        return;
-    std::string cmd = "rm -f '" + storage + "'/*.data";
-    if (system(cmd.c_str()) != 0)
-        fprintf(stderr, "could not empty %s\n", storage.c_str());
-}
-
-struct RunResult {
-    double wall = 0, cpu = 0;
-    bool ok = false;
-};
-
-RunResult engine_upload(Target &target, const std::string &path, int size, long *peak_rss_growth)
-{
-    RunResult r;
-    std::string url = target.upload_url();
-    if (url.empty())
-        return r;
-    Waiter w;
-    TransferItem *item = new_upload(&w, url, path, size);
-    long base_rss = rss_kib(), peak = base_rss;
-    double cpu0 = self_cpu();
-    auto t0 = Clock::now();
-    zv_curl_send_request(item);
-    while (!w.wait(0.05))
-        peak = std::max(peak, rss_kib());
-    r.wall = seconds_since(t0);
-    r.cpu = self_cpu() - cpu0;
-    r.ok = w.http_code == 200 || w.http_code == 201;
-    if (peak_rss_growth)
-        *peak_rss_growth = std::max(*peak_rss_growth, peak - base_rss);
-    zv_curl_delete(&item);
-    return r;
-}
-
 RunResult curl_upload(Target &target, const std::string &path)
 {
     RunResult r;
@@ -378,24 +172,6 @@ class FirstByteProbe
     int fd_ = -1;
     int port_ = 0;
 };
-
-double median(std::vector<double> v)
-{
-    std::sort(v.begin(), v.end());
-    return v.empty() ? 0 : v[v.size() / 2];
-}
-
-void report(const char *name, const std::string &figure, const char *target, bool pass)
-{
-    printf("%-34s %-44s target %-14s %s\n", name, figure.c_str(), target, pass ? "PASS" : "MISS");
-}
-
-std::string fmt(const char *f, double a, double b = 0, double c = 0)
-{
-    char buf[160];
-    snprintf(buf, sizeof buf, f, a, b, c);
-    return buf;
-}
 
 } // namespace
 

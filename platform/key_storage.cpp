@@ -3,6 +3,7 @@
 // group or others can reach is refused, and the reason logged.
 // Thread safety: any thread (no shared state).
 #include "key_storage.h"
+#include "zv-platform-util.h"
 
 #include <errno.h>
 #include <fcntl.h>
@@ -117,33 +118,9 @@ int key_storage_set(const char *name, const char *value)
         return KEY_STORAGE_ERROR_IO;
     }
     std::string path = dir + "/" + name;
-    std::string tmpl = dir + "/." + name + ".XXXXXX";
-    int fd = mkostemp(&tmpl[0], O_CLOEXEC); // mode 0600
-    if (fd < 0) {
-        ZV_LOGE("cannot write key storage entry %s: %s", path.c_str(), strerror(errno));
-        return KEY_STORAGE_ERROR_IO;
-    }
     // The newline keeps a value that ends in one intact through the read.
-    std::string data = std::string(value) + "\n";
-    const char *p = data.data();
-    size_t left = data.size();
-    bool ok = true;
-    while (left > 0) {
-        ssize_t n = write(fd, p, left);
-        if (n < 0 && errno == EINTR)
-            continue;
-        if (n <= 0) {
-            ok = false;
-            break;
-        }
-        p += n;
-        left -= (size_t)n;
-    }
-    ok = fsync(fd) == 0 && ok;
-    ok = close(fd) == 0 && ok;
-    if (!ok || rename(tmpl.c_str(), path.c_str()) != 0) {
+    if (!zv_platform_replace_file(path, std::string(value) + "\n", true)) {
         ZV_LOGE("cannot write key storage entry %s: %s", path.c_str(), strerror(errno));
-        unlink(tmpl.c_str());
         return KEY_STORAGE_ERROR_IO;
     }
     return KEY_STORAGE_ERROR_NONE;

@@ -53,6 +53,10 @@ using StmtPtr = std::unique_ptr<sqlite3_stmt, StmtFinalizer>;
 struct MediaState {
     std::mutex lock;
     int connections = 0;
+    // The read-only connection of the lookups, opened at the first one and kept while the
+    // caller stays connected: opening the file for every lookup would cost more than the
+    // lookup itself (a list of thousands of videos looks each one up at start).
+    DbPtr lookup_db;
 };
 
 MediaState &media_state()
@@ -288,6 +292,52 @@ struct media_info_s {
     std::optional<std::string> display_name;
 };
 
+// The rows of the media table that match the filter, in the order they were registered.
+static int read_media_rows(sqlite3 *db, filter_h filter, std::vector<media_info_s> *rows)
+{
+    static const char *const collate_sql[] = {"", " COLLATE NOCASE", " COLLATE RTRIM"};
+    std::string sql = "SELECT path, media_type, thumbnail_path, display_name FROM media";
+    const std::vector<Term> no_terms;
+    const std::vector<Term> &terms = filter ? filter->terms : no_terms;
+    for (size_t i = 0; i < terms.size(); i++) {
+        sql += i == 0 ? " WHERE " : " AND ";
+        sql += column_sql(terms[i].column);
+        sql += " = ?";
+        if (!terms[i].is_int && filter)
+            sql += collate_sql[filter->collation];
+    }
+    sql += " ORDER BY rowid";
+
+    sqlite3_stmt *raw = nullptr;
+    if (sqlite3_prepare_v2(db, sql.c_str(), -1, &raw, nullptr) != SQLITE_OK) {
+        // A database the companion never filled has no media table: nothing to find.
+        if (strncmp(sqlite3_errmsg(db), "no such table", 13) == 0)
+            return MEDIA_CONTENT_ERROR_NONE;
+        ZV_LOGE("media lookup: %s", sqlite3_errmsg(db));
+        return MEDIA_CONTENT_ERROR_DB_FAILED;
+    }
+    StmtPtr stmt(raw);
+    if (!bind_terms(stmt.get(), terms)) {
+        ZV_LOGE("media lookup: %s", sqlite3_errmsg(db));
+        return MEDIA_CONTENT_ERROR_DB_FAILED;
+    }
+    for (;;) {
+        int rc = sqlite3_step(stmt.get());
+        if (rc == SQLITE_DONE)
+            return MEDIA_CONTENT_ERROR_NONE;
+        if (rc != SQLITE_ROW) {
+            ZV_LOGE("media lookup: %s", sqlite3_errmsg(db));
+            return rc == SQLITE_BUSY ? MEDIA_CONTENT_ERROR_DB_BUSY : MEDIA_CONTENT_ERROR_DB_FAILED;
+        }
+        media_info_s info;
+        info.path = column_text(stmt.get(), 0).value_or("");
+        info.type = sqlite3_column_int(stmt.get(), 1);
+        info.thumbnail_path = column_text(stmt.get(), 2);
+        info.display_name = column_text(stmt.get(), 3);
+        rows->push_back(std::move(info));
+    }
+}
+
 int media_content_connect(void)
 {
     MediaState &st = media_state();
@@ -302,7 +352,8 @@ int media_content_disconnect(void)
     std::lock_guard<std::mutex> guard(st.lock);
     if (st.connections == 0)
         return MEDIA_CONTENT_ERROR_DB_FAILED;
-    st.connections--;
+    if (--st.connections == 0)
+        st.lookup_db.reset();
     return MEDIA_CONTENT_ERROR_NONE;
 }
 
@@ -343,61 +394,28 @@ int media_info_foreach_media_from_db(filter_h filter, media_info_cb callback, vo
 {
     if (!callback)
         return MEDIA_CONTENT_ERROR_INVALID_PARAMETER;
+
+    // The matching rows are read under the lock; the callback runs after it is released, so
+    // that it may call back into this interface.
+    std::vector<media_info_s> found;
     {
         MediaState &st = media_state();
         std::lock_guard<std::mutex> guard(st.lock);
         if (st.connections == 0)
             return MEDIA_CONTENT_ERROR_INVALID_OPERATION;
-    }
-
-    DbPtr db;
-    int rc = open_for_lookup(&db);
-    if (rc != MEDIA_CONTENT_ERROR_NONE || !db)
-        return rc;
-
-    static const char *const collate_sql[] = {"", " COLLATE NOCASE", " COLLATE RTRIM"};
-    std::string sql = "SELECT path, media_type, thumbnail_path, display_name FROM media";
-    const std::vector<Term> no_terms;
-    const std::vector<Term> &terms = filter ? filter->terms : no_terms;
-    for (size_t i = 0; i < terms.size(); i++) {
-        sql += i == 0 ? " WHERE " : " AND ";
-        sql += column_sql(terms[i].column);
-        sql += " = ?";
-        if (!terms[i].is_int && filter)
-            sql += collate_sql[filter->collation];
-    }
-    sql += " ORDER BY rowid";
-
-    sqlite3_stmt *raw = nullptr;
-    if (sqlite3_prepare_v2(db.get(), sql.c_str(), -1, &raw, nullptr) != SQLITE_OK) {
-        // A database the companion never filled has no media table: nothing to find.
-        if (strncmp(sqlite3_errmsg(db.get()), "no such table", 13) == 0)
-            return MEDIA_CONTENT_ERROR_NONE;
-        ZV_LOGE("media lookup: %s", sqlite3_errmsg(db.get()));
-        return MEDIA_CONTENT_ERROR_DB_FAILED;
-    }
-    StmtPtr stmt(raw);
-    if (!bind_terms(stmt.get(), terms)) {
-        ZV_LOGE("media lookup: %s", sqlite3_errmsg(db.get()));
-        return MEDIA_CONTENT_ERROR_DB_FAILED;
-    }
-
-    for (;;) {
-        rc = sqlite3_step(stmt.get());
-        if (rc == SQLITE_DONE)
-            return MEDIA_CONTENT_ERROR_NONE;
-        if (rc != SQLITE_ROW) {
-            ZV_LOGE("media lookup: %s", sqlite3_errmsg(db.get()));
-            return rc == SQLITE_BUSY ? MEDIA_CONTENT_ERROR_DB_BUSY : MEDIA_CONTENT_ERROR_DB_FAILED;
+        if (!st.lookup_db) {
+            int rc = open_for_lookup(&st.lookup_db);
+            if (rc != MEDIA_CONTENT_ERROR_NONE || !st.lookup_db)
+                return rc;
         }
-        media_info_s info;
-        info.path = column_text(stmt.get(), 0).value_or("");
-        info.type = sqlite3_column_int(stmt.get(), 1);
-        info.thumbnail_path = column_text(stmt.get(), 2);
-        info.display_name = column_text(stmt.get(), 3);
-        if (!callback(&info, user_data))
-            return MEDIA_CONTENT_ERROR_NONE;
+        int rc = read_media_rows(st.lookup_db.get(), filter, &found);
+        if (rc != MEDIA_CONTENT_ERROR_NONE)
+            return rc;
     }
+    for (media_info_s &info : found)
+        if (!callback(&info, user_data))
+            break;
+    return MEDIA_CONTENT_ERROR_NONE;
 }
 
 int media_info_clone(media_info_h *dst, media_info_h src)

@@ -5,6 +5,7 @@
 // has one; its ids are kept in notifications/desktop/TAG so that another process can replace
 // or close what this one showed.
 #include "notification.h"
+#include "zv-platform-util.h"
 
 #include <Eldbus.h>
 #include <app.h>
@@ -192,12 +193,10 @@ int write_tray_file(const _notification &n)
     std::string dir = ensure_tray_dir();
     if (dir.empty())
         return NOTIFICATION_ERROR_IO_ERROR;
-    std::string data = to_key_file(n);
-    GError *error = nullptr;
-    if (!g_file_set_contents((dir + "/" + n.tag + ".ini").c_str(), data.data(), (gssize)data.size(),
-                             &error)) {
-        ZV_LOGE("notification %s: %s", n.tag.c_str(), error->message);
-        g_error_free(error);
+    // The tray is volatile, like the runtime folder: no flush to the disk for every update of
+    // an ongoing notification.
+    if (!zv_platform_replace_file(dir + "/" + n.tag + ".ini", to_key_file(n), false)) {
+        ZV_LOGE("notification %s: %s", n.tag.c_str(), strerror(errno));
         return NOTIFICATION_ERROR_IO_ERROR;
     }
     return NOTIFICATION_ERROR_NONE;

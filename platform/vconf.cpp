@@ -6,6 +6,7 @@
 // Thread safety: getters and setters from any thread (no shared state); watches are
 // registered, removed and delivered on the main loop only.
 #include "vconf.h"
+#include "zv-platform-util.h"
 
 #include <Ecore.h>
 #include <errno.h>
@@ -122,37 +123,12 @@ int write_value(const char *key, const std::string &text)
     if (path.empty())
         return VCONF_ERROR;
     GCharPtr dir(g_path_get_dirname(path.c_str()));
-    GCharPtr base(g_path_get_basename(path.c_str()));
     if (g_mkdir_with_parents(dir.get(), 0700) != 0) {
         ZV_LOGE("cannot make %s: %s", dir.get(), strerror(errno));
         return VCONF_ERROR;
     }
-    std::string tmpl = std::string(dir.get()) + "/." + base.get() + ".XXXXXX";
-    int fd = mkostemp(&tmpl[0], O_CLOEXEC);
-    if (fd < 0) {
+    if (!zv_platform_replace_file(path, text + "\n", false)) {
         ZV_LOGE("cannot write %s: %s", path.c_str(), strerror(errno));
-        return VCONF_ERROR;
-    }
-    std::string data = text + "\n";
-    const char *p = data.data();
-    size_t left = data.size();
-    bool ok = true;
-    while (left > 0) {
-        ssize_t n = write(fd, p, left);
-        if (n < 0 && errno == EINTR)
-            continue;
-        if (n <= 0) {
-            ok = false;
-            break;
-        }
-        p += n;
-        left -= (size_t)n;
-    }
-    if (close(fd) != 0)
-        ok = false;
-    if (!ok || rename(tmpl.c_str(), path.c_str()) != 0) {
-        ZV_LOGE("cannot write %s: %s", path.c_str(), strerror(errno));
-        unlink(tmpl.c_str());
         return VCONF_ERROR;
     }
     return VCONF_OK;

@@ -740,6 +740,25 @@ static void delete_list_page(AppData *ad)
     ad->pListLayout = nullptr;
 }
 
+// The first frame that shows the job list is logged once per process, with the number of
+// jobs: the moment a user sees the list (start-up is measured to this line).
+static void first_list_frame_cb(void *data, Evas *e, void *)
+{
+    evas_event_callback_del_full(e, EVAS_CALLBACK_RENDER_POST, first_list_frame_cb, data);
+    auto *ad = static_cast<AppData *>(data);
+    ZV_LOGI("job list drawn: %u jobs", ad->job_list ? g_list_length(ad->job_list) : 0u);
+}
+
+static void watch_first_list_frame(AppData *ad, Evas_Object *genlist)
+{
+    static bool watched = false;
+    if (watched || !genlist)
+        return;
+    watched = true;
+    evas_event_callback_add(evas_object_evas_get(genlist), EVAS_CALLBACK_RENDER_POST,
+                            first_list_frame_cb, ad);
+}
+
 int zv_upload_view_init(AppData *ad)
 {
     ZV_LOG_ENTER();
@@ -785,6 +804,7 @@ int zv_upload_view_init(AppData *ad)
         ad->pGenlist = _zv_upload_list_create_genlist(ad->navi);
         elm_object_part_content_set(ad->pListLayout, "elm.swallow.content", ad->pGenlist);
         _zv_upload_list_append_item_data(ad);
+        watch_first_list_frame(ad, ad->pGenlist);
     } else {
         ZV_LOGI("[view init] Create nocontents layout.");
         ad->pNoContent = _zv_upload_list_create_nocontent_layout(ad->pListLayout);
