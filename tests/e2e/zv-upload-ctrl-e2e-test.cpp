@@ -3,9 +3,13 @@
 // of the process in the background. The controller runs with a real window and list view,
 // the service client and its worker thread, and the history file of a temporary folder.
 #include <Elementary.h>
+#include <app.h>
 #include <gtest/gtest.h>
 
+#include <fstream>
 #include <map>
+#include <random>
+#include <set>
 #include <string>
 #include <vector>
 
@@ -13,6 +17,7 @@
 #include "zv-e2e-util.h"
 #include "zv-ext-network.h"
 #include "zv-upload-ctrl.h"
+#include "zv-upload-view.h"
 
 namespace
 {
@@ -63,8 +68,15 @@ class CtrlE2ETest : public ::testing::Test
     }
     void start_controller()
     {
+        // The application's theme extension holds the layouts of the list and edit pages.
+        char *res = app_get_resource_path();
+        std::string edj = std::string(res ? res : "") + "edje/zuvo-upload-custom-winset.edj";
+        free(res);
+        elm_theme_extension_add(nullptr, edj.c_str());
         ad_.win = elm_win_add(nullptr, "zv-e2e", ELM_WIN_BASIC);
         ad_.navi = elm_naviframe_add(ad_.win);
+        evas_object_size_hint_weight_set(ad_.navi, EVAS_HINT_EXPAND, EVAS_HINT_EXPAND);
+        elm_win_resize_object_add(ad_.win, ad_.navi);
         evas_object_resize(ad_.win, 480, 800);
         evas_object_show(ad_.navi);
         evas_object_show(ad_.win);
@@ -198,6 +210,179 @@ TEST_F(CtrlE2ETest, BackgroundCompletionOfTheLastJobEndsTheProcess)
     EXPECT_TRUE(g_log.logged("Not exist running job"));
     expect_identical(ids[0], a);
     expect_identical(ids[1], b);
+}
+
+
+void on_transition(void *data, Evas_Object *, void *) { *static_cast<bool *>(data) = true; }
+
+// The first visible widget of a type on the window's canvas.
+Evas_Object *find_widget(Evas_Object *win, const char *type)
+{
+    for (Evas_Object *o = evas_object_bottom_get(evas_object_evas_get(win)); o;
+         o = evas_object_above_get(o)) {
+        const char *t = elm_object_widget_check(o) ? elm_object_widget_type_get(o) : nullptr;
+        if (t && strcmp(t, type) == 0 && evas_object_visible_get(o))
+            return o;
+    }
+    return nullptr;
+}
+
+// Thirty uploads side by side while network events, pauses and resumes from the badge,
+// deletions in edit mode and a second launch request arrive at moments chosen by a seeded
+// generator (ZV_STRESS_SEED replays a run). Afterwards every job that was not deleted is
+// completed with the server's copy byte-identical, no data upload sent a byte the server
+// held, and the deleted jobs have no row left.
+TEST_F(CtrlE2ETest, StressOfThirtyJobsWithEventsAtRandomMoments)
+{
+    const char *seed_env = getenv("ZV_STRESS_SEED");
+    const unsigned seed = seed_env ? static_cast<unsigned>(strtoul(seed_env, nullptr, 10)) : 20261123u;
+    printf("stress seed %u (ZV_STRESS_SEED=%u replays this run)\n", seed, seed);
+    std::mt19937 rng(seed);
+
+    ASSERT_TRUE(start_server({"kind=data,action=throttle,rate=250000,times=0"}));
+    std::vector<std::string> files;
+    for (int i = 0; i < 30; ++i)
+        files.push_back(video("v" + std::to_string(i) + ".mp4", 150000 + 7919 * i, 100 + i));
+    std::vector<int> ids = zv_e2e::record(std::vector<std::string>(files.begin(), files.begin() + 20),
+                                          "Stress");
+    ASSERT_EQ(ids.size(), 20u);
+    start_controller();
+    launch();
+
+    std::map<std::string, int> events;
+    std::set<int> deleted;
+    auto jobs_in = [&](int status) {
+        std::vector<UploadItem *> found;
+        for (GList *l = ad_.job_list; l; l = l->next) {
+            auto *job = static_cast<UploadItem *>(l->data);
+            if (job && job->status == status)
+                found.push_back(job);
+        }
+        return found;
+    };
+    auto pick = [&](const std::vector<UploadItem *> &from) {
+        return from[std::uniform_int_distribution<size_t>(0, from.size() - 1)(rng)];
+    };
+    // Remove one job the way a user does: the more key's menu, its row, Done, and Stop when
+    // the question comes.
+    // Remove one job the way a user does: the more key's menu, its row, Done, and Stop when
+    // the question comes. What went wrong, or nothing.
+    auto delete_in_edit_mode = [&](UploadItem *job) -> std::string {
+        int historyid = job->historyid;
+        // The naviframe pops no page while it is still sliding in.
+        static bool slid_in;
+        slid_in = false;
+        evas_object_smart_callback_del(ad_.navi, "transition,finished", on_transition);
+        evas_object_smart_callback_add(ad_.navi, "transition,finished", on_transition, &slid_in);
+        zv_upload_view_morekey_cb(&ad_, nullptr, nullptr);
+        if (!ad_.pCtxPopup)
+            return "no menu";
+        elm_ctxpopup_item_selected_set(elm_ctxpopup_first_item_get(ad_.pCtxPopup), EINA_TRUE);
+        if (!run_until([&] { return ad_.pEditGenlist && job->edit_gen_item && slid_in; }, 5000))
+            return "no edit list";
+        // A tap reaches a row on the screen: the list is scrolled to it first.
+        elm_genlist_item_show(job->edit_gen_item, ELM_GENLIST_ITEM_SCROLLTO_IN);
+        if (!run_until([&] { return job->check != nullptr; }, 5000))
+            return "the row is not shown";
+        elm_genlist_item_selected_set(job->edit_gen_item, EINA_TRUE);
+        if (!job->checked)
+            return "the row is not checked";
+        Elm_Object_Item *page = elm_naviframe_top_item_get(ad_.navi);
+        Evas_Object *done = elm_object_item_part_content_get(page, "title_right_btn");
+        if (!done)
+            done = elm_object_item_part_content_get(page, "next_btn");
+        if (!done)
+            return "no Done button";
+        evas_object_smart_callback_call(done, "clicked", nullptr);
+        if (Evas_Object *popup = find_widget(ad_.win, "Elm_Popup"))
+            evas_object_smart_callback_call(elm_object_part_content_get(popup, "button2"),
+                                            "clicked", nullptr);
+        deleted.insert(historyid);
+        if (!run_until([&] { return ad_.pEditLayout == nullptr; }, 5000))
+            return "the edit page stays";
+        return "";
+    };
+
+    std::uniform_int_distribution<int> pause_ms(20, 150), kind(0, 9);
+    bool second_launch = false;
+    for (int step = 0; step < 60; ++step) {
+        run_until([] { return false; }, pause_ms(rng));
+        int k = kind(rng);
+        if (k <= 1) {
+            ASSERT_TRUE(zv_e2e::set_int_key("memory/dnet/status", 2));
+            events["network event"]++;
+        } else if (k <= 4 && !jobs_in(ZV_UPLOAD_STATUS_UPLOADING).empty()) {
+            ad_.pause_upload(&ad_, pick(jobs_in(ZV_UPLOAD_STATUS_UPLOADING)));
+            events["badge pause"]++;
+        } else if (k <= 7 && !jobs_in(ZV_UPLOAD_STATUS_PAUSED).empty()) {
+            ad_.resume_upload(&ad_, pick(jobs_in(ZV_UPLOAD_STATUS_PAUSED)));
+            events["badge resume"]++;
+        } else if (k == 8 && deleted.size() < 4 && g_list_length(ad_.job_list) > 1) {
+            std::vector<UploadItem *> all;
+            for (GList *l = ad_.job_list; l; l = l->next)
+                all.push_back(static_cast<UploadItem *>(l->data));
+            ASSERT_EQ(delete_in_edit_mode(pick(all)), "");
+            events["deletion in edit mode"]++;
+        } else if (k == 9 && !second_launch) {
+            std::vector<int> more = zv_e2e::record(
+                std::vector<std::string>(files.begin() + 20, files.end()), "Stress");
+            ASSERT_EQ(more.size(), 10u);
+            ids.insert(ids.end(), more.begin(), more.end());
+            launch();
+            second_launch = true;
+            events["second launch request"]++;
+        }
+    }
+    if (!second_launch) {
+        std::vector<int> more =
+            zv_e2e::record(std::vector<std::string>(files.begin() + 20, files.end()), "Stress");
+        ids.insert(ids.end(), more.begin(), more.end());
+        launch();
+        events["second launch request"]++;
+    }
+
+    // The rest at full speed: paused jobs are resumed until every remaining one completes.
+    ASSERT_TRUE(server_.clear_faults());
+    std::vector<int> kept;
+    for (int id : ids)
+        if (!deleted.count(id))
+            kept.push_back(id);
+    ASSERT_TRUE(run_until(
+        [&] {
+            for (UploadItem *job : jobs_in(ZV_UPLOAD_STATUS_PAUSED))
+                ad_.resume_upload(&ad_, job);
+            auto rows = stored_rows();
+            for (int id : kept)
+                if (rows[id].status != ZV_UPLOAD_STATUS_COMPLETED)
+                    return false;
+            return true;
+        },
+        3 * kLongWaitMs));
+
+    auto rows = stored_rows();
+    for (int id : deleted)
+        EXPECT_EQ(rows.count(id), 0u) << "row " << id << " was deleted in edit mode";
+    int identical = 0;
+    for (size_t i = 0; i < ids.size(); ++i) {
+        if (deleted.count(ids[i]))
+            continue;
+        Upload u = upload_of(ids[i]);
+        bool same = u.complete && zv_test::read_file(u.path) == contents_[files[i]];
+        EXPECT_TRUE(same) << "server copy of " << files[i];
+        identical += same;
+    }
+    for (const LoggedRequest &r : server_.requests())
+        EXPECT_NE(r.status, 416) << "a data upload sent bytes the server held";
+
+    std::string summary = "stress: seed " + std::to_string(seed) + ", 30 jobs";
+    for (const auto &e : events)
+        summary += ", " + std::to_string(e.second) + " " + e.first;
+    summary += "; " + std::to_string(identical) + " of " + std::to_string(kept.size()) +
+               " kept jobs completed byte-identical, " + std::to_string(deleted.size()) +
+               " deleted with their rows; " + (HasFailure() ? "FAILED" : "nothing lost");
+    printf("%s\n", summary.c_str());
+    if (const char *dir = getenv("ZV_REPORT_DIR"))
+        std::ofstream(std::string(dir) + "/stress.txt") << summary << "\n";
 }
 
 } // namespace
