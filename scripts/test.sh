@@ -1,9 +1,16 @@
 #!/usr/bin/env bash
 # The project's test command: installs the Debian packages it needs when they are missing,
-# configures build/, builds everything and runs the whole test suite.
-# CI=true turns warnings into errors.
+# then builds and runs
+#   1. the whole suite (build/),
+#   2. the whole suite again under AddressSanitizer + UndefinedBehaviorSanitizer (build-asan/),
+#   3. the engine, client and controller tests, the stress test among them, under
+#      ThreadSanitizer (build-tsan/),
+#   4. every fuzz target for a few seconds on its seed corpus (build-fuzz/, clang),
+# and prints one reliability report at the end. CI=true turns warnings into errors.
+# ZV_TEST_STAGES picks stages (default "plain asan tsan fuzz").
 set -euo pipefail
 cd "$(dirname "$0")/.."
+top=$PWD
 
 # shellcheck source=scripts/deps.sh
 . scripts/deps.sh
@@ -11,7 +18,85 @@ zv_install_deps
 
 werror=OFF
 [ "${CI:-}" = "true" ] && werror=ON
+stages=${ZV_TEST_STAGES:-plain asan tsan fuzz}
+jobs=$(nproc)
 
-cmake -S . -B build -DCMAKE_BUILD_TYPE=RelWithDebInfo -DZV_WERROR="$werror"
-cmake --build build -j"$(nproc)"
-ctest --test-dir build --output-on-failure -j2 --timeout 600
+export ZV_REPORT_DIR="$top/build/report"
+rm -rf "$ZV_REPORT_DIR"
+mkdir -p "$ZV_REPORT_DIR"
+status=0
+
+# Runs ctest in a build folder; one report line with the counts.
+run_suite() {
+  local name=$1 dir=$2
+  shift 2
+  local log="$ZV_REPORT_DIR/$name.log" start=$SECONDS rc=0
+  ctest --test-dir "$dir" --output-on-failure -j2 --timeout 600 "$@" 2>&1 | tee "$log" |
+    grep -a -E '^ *[0-9]+/[0-9]+ Test|tests passed|\*\*\*|Failure|ERROR|WARNING: ThreadSanitizer|runtime error' || true
+  rc=${PIPESTATUS[0]}
+  local summary
+  summary=$(grep -a -E '[0-9]+% tests passed' "$log" | tail -n 1)
+  printf '%-34s %s (%ss)\n' "$name" "${summary:-no tests ran}" "$((SECONDS - start))" \
+    >>"$ZV_REPORT_DIR/sanitizers.txt"
+  if [ "$rc" != 0 ] || [ -z "$summary" ]; then
+    status=1
+  fi
+}
+
+configure() { # dir, extra cmake arguments
+  local dir=$1
+  shift
+  cmake -S . -B "$dir" -DCMAKE_BUILD_TYPE=RelWithDebInfo -DZV_WERROR="$werror" "$@" >/dev/null
+}
+
+if [[ " $stages " == *" plain "* ]]; then
+  echo "== build and tests"
+  configure build
+  cmake --build build -j"$jobs"
+  run_suite "plain build, whole suite" build
+fi
+
+if [[ " $stages " == *" asan "* ]]; then
+  echo "== AddressSanitizer + UndefinedBehaviorSanitizer"
+  configure build-asan -DZV_SANITIZE=address
+  cmake --build build-asan -j"$jobs"
+  LSAN_OPTIONS="suppressions=$top/tests/sanitizers/lsan.supp:print_suppressions=0" \
+  ASAN_OPTIONS="halt_on_error=1:detect_leaks=1" \
+  UBSAN_OPTIONS="print_stacktrace=1:halt_on_error=1" \
+    run_suite "address+undefined, whole suite" build-asan
+fi
+
+if [[ " $stages " == *" tsan "* ]]; then
+  echo "== ThreadSanitizer"
+  configure build-tsan -DZV_SANITIZE=thread
+  # The transfer engine, the service client and the controller, in process and as the real
+  # service, with the programs those tests start.
+  cmake --build build-tsan -j"$jobs" --target zv-plugin-curl-test zv-plugin-main-test \
+    zv-upload-ctrl-test zv-upload-list-test zv-upload-ctrl-e2e-test zv-upload-svc-e2e-test \
+    zuvo-upload-svc zuvo-devserver zuvo-client zv-vconf zv-keystore zv_resources
+  TSAN_OPTIONS="halt_on_error=1:second_deadlock_stack=1:suppressions=$top/tests/sanitizers/tsan.supp" \
+    run_suite "thread: engine, client, controller" build-tsan \
+    -R '^(Engine|ClientTest|AccountTest|CategoryListTest|RunningUploadTest|UploadCtrlTest|UploadListTest|CtrlE2ETest|ServiceE2ETest)'
+fi
+
+if [[ " $stages " == *" fuzz "* ]] && [ -x scripts/fuzz.sh ]; then
+  echo "== fuzz targets"
+  if ! scripts/fuzz.sh --seconds "${ZV_FUZZ_SECONDS:-5}" --report "$ZV_REPORT_DIR/fuzz.txt"; then
+    status=1
+  fi
+fi
+
+echo
+echo "== reliability report"
+for part in sanitizers stress faults fuzz; do
+  if [ -s "$ZV_REPORT_DIR/$part.txt" ]; then
+    echo "-- $part"
+    cat "$ZV_REPORT_DIR/$part.txt"
+  fi
+done
+if [ "$status" = 0 ]; then
+  echo "all stages passed"
+else
+  echo "SOME STAGES FAILED (logs in $ZV_REPORT_DIR)"
+fi
+exit "$status"

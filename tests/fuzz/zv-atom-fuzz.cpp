@@ -1,0 +1,89 @@
+// The Atom entry of a metadata upload from arbitrary field values (NUL-separated in the
+// input). The entry must come out for any values; for values that are valid UTF-8, hold no
+// character XML forbids and no '&' (entity references are interpreted by design), it must be
+// a well-formed document that gives the title back.
+#include <glib.h>
+#include <libxml/parser.h>
+#include <libxml/tree.h>
+#include <stdint.h>
+#include <stdlib.h>
+#include <string.h>
+
+#include <string>
+#include <vector>
+
+#include "zv-plugin-xml.h"
+
+namespace
+{
+
+bool plain_text(const std::string &s)
+{
+    if (!g_utf8_validate(s.data(), static_cast<gssize>(s.size()), nullptr))
+        return false;
+    for (unsigned char c : s)
+        if ((c < 0x20 && c != '\t' && c != '\n') || c == '&' || c == '\r')
+            return false;
+    return true;
+}
+
+// The text of the first element named `name` anywhere below `node`.
+std::string find_text(xmlNode *node, const char *name)
+{
+    for (xmlNode *n = node; n; n = n->next) {
+        if (n->type == XML_ELEMENT_NODE && strcmp(reinterpret_cast<const char *>(n->name), name) == 0) {
+            xmlChar *content = xmlNodeGetContent(n);
+            std::string text = content ? reinterpret_cast<const char *>(content) : "";
+            xmlFree(content);
+            return text;
+        }
+        std::string below = find_text(n->children, name);
+        if (!below.empty())
+            return below;
+    }
+    return "";
+}
+
+} // namespace
+
+extern "C" int LLVMFuzzerInitialize(int *, char ***)
+{
+    setenv("ZV_DATA_HOST", "data.example", 1);
+    xmlInitParser();
+    return 0;
+}
+
+extern "C" int LLVMFuzzerTestOneInput(const uint8_t *data, size_t size)
+{
+    std::vector<std::string> fields;
+    std::string input(reinterpret_cast<const char *>(data), size);
+    size_t start = 0;
+    while (fields.size() < 7) {
+        size_t end = input.find('\0', start);
+        fields.push_back(input.substr(start, end == std::string::npos ? std::string::npos : end - start));
+        if (end == std::string::npos)
+            break;
+        start = end + 1;
+    }
+    fields.resize(7);
+    auto arg = [&](size_t i) { return fields[i].empty() ? nullptr : fields[i].c_str(); };
+    bool is_private = size > 0 && (data[0] & 1);
+    char *doc = zv_plugin_xml_compose_request(arg(0), arg(1), arg(2), arg(3), arg(4), arg(5),
+                                              is_private, arg(6));
+    if (!doc)
+        __builtin_trap(); // an entry is made for any values
+    bool checkable = true;
+    for (const std::string &f : fields)
+        checkable = checkable && plain_text(f);
+    if (checkable) {
+        xmlDoc *parsed = xmlReadMemory(doc, static_cast<int>(strlen(doc)), "entry.xml", nullptr,
+                                       XML_PARSE_NONET | XML_PARSE_NOERROR | XML_PARSE_NOWARNING);
+        if (!parsed)
+            __builtin_trap(); // not well-formed
+        if (!fields[0].empty() && find_text(xmlDocGetRootElement(parsed), "title") != fields[0])
+            __builtin_trap(); // the title did not survive
+        xmlFreeDoc(parsed);
+    }
+    free(doc);
+    return 0;
+}
