@@ -94,6 +94,13 @@ for part in sanitizers stress faults fuzz; do
     cat "$ZV_REPORT_DIR/$part.txt"
   fi
 done
+# Every build runs the fault scenarios: the total is over all of them.
+if [ -s "$ZV_REPORT_DIR/faults.txt" ]; then
+  sed -n 's/.*: \([0-9]*\) injected, \([0-9]*\) survived$/\1 \2/p' "$ZV_REPORT_DIR/faults.txt" |
+    awk '{ i += $1; s += $2 }
+      END { printf "faults in all: %d injected, %d survived; %s\n", i, s,
+            (i == s ? "nothing lost" : "SOME LOST") }'
+fi
 if [ "$status" = 0 ]; then
   echo "all stages passed"
 else

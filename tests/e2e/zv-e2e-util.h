@@ -2,6 +2,8 @@
 // endpoints and request log, and the programs of the build that record jobs and set keys.
 #pragma once
 
+#include <errno.h>
+
 #include <ctype.h>
 #include <curl/curl.h>
 #include <signal.h>
@@ -71,9 +73,15 @@ class Child
         if (pid_ <= 0 || exited_)
             return false;
         int status = 0;
-        if (waitpid(pid_, &status, WNOHANG) == pid_) {
+        pid_t got = waitpid(pid_, &status, WNOHANG);
+        if (got == pid_) {
             exited_ = true;
             status_ = status;
+            return false;
+        }
+        // The toolkit's main loop reaps children too: a child it took is gone all the same.
+        if (got < 0 && errno == ECHILD) {
+            exited_ = true;
             return false;
         }
         return true;
