@@ -6,6 +6,7 @@
 #include <sys/stat.h>
 #include <sys/wait.h>
 
+#include <filesystem>
 #include <map>
 #include <memory>
 #include <string>
@@ -146,6 +147,18 @@ TEST_F(ServiceE2ETest, TwoRecordedFilesUploadSideBySide)
     int status = 0;
     ASSERT_TRUE(svc.wait_exit(kLongWaitMs, &status));
     EXPECT_TRUE(WIFEXITED(status) && WEXITSTATUS(status) == 0);
+
+    // Neither the token nor the API key reaches the log (libcurl's verbose lines included)
+    // or any file the service wrote: the history, the tray, the keys of the runtime folder.
+    std::vector<std::string> written = {log_path(), getenv("ZV_HISTORY_DB")};
+    for (const auto &entry : std::filesystem::recursive_directory_iterator(run))
+        if (entry.is_regular_file())
+            written.push_back(entry.path().string());
+    ASSERT_TRUE(logged("Authorization: ****")) << "the verbose lines are in the log, masked";
+    for (const std::string &file : written)
+        for (const char *secret : {"dev-token", "dev-key"})
+            EXPECT_EQ(zv_test::read_file(file).find(secret), std::string::npos)
+                << secret << " in " << file;
 }
 
 TEST_F(ServiceE2ETest, KilledMidUploadResumesWithStatusQueryAtNextStart)
