@@ -47,6 +47,8 @@ namespace {
 constexpr const char kAppId[] = "zuvo-upload-svc";
 constexpr const char kSocketName[] = "zuvo-upload-svc.sock";
 constexpr const char kLockName[] = "zuvo-upload-svc.lock";
+// The first launch request of a service started by spawn_service, hex-encoded.
+constexpr const char kLaunchRequestEnv[] = "ZV_LAUNCH_REQUEST";
 // How long a later process keeps trying to reach (or become) the instance, and how long it
 // waits for the instance to take its request.
 constexpr int kElectionTimeoutMs = 5000;
@@ -61,6 +63,7 @@ struct GFreeDeleter {
     void operator()(void *p) const { g_free(p); }
 };
 using GCharPtr = std::unique_ptr<char, GFreeDeleter>;
+using GBytePtr = std::unique_ptr<unsigned char, GFreeDeleter>;
 
 // Closes a descriptor at scope end unless released.
 class Fd {
@@ -665,6 +668,25 @@ app_control_h parse_arguments(int argc, char **argv)
             usage_error(prog, std::string("unknown argument '") + arg + "'");
         }
     }
+    // A request handed over by the program that started this one (see spawn_service).
+    if (const char *handed = getenv(kLaunchRequestEnv)) {
+        std::string bytes;
+        size_t len = strlen(handed);
+        for (size_t i = 0; i + 1 < len; i += 2)
+            bytes += static_cast<char>(g_ascii_xdigit_value(handed[i]) * 16 +
+                                       g_ascii_xdigit_value(handed[i + 1]));
+        app_control_h passed = nullptr;
+        if (len % 2 == 0 &&
+            zv_app_launch_message_parse(reinterpret_cast<const unsigned char *>(bytes.data()),
+                                        bytes.size(), &passed) == APP_CONTROL_ERROR_NONE) {
+            for (const auto &kv : passed->extras)
+                app_control_add_extra_data(request, kv.first.c_str(), kv.second.c_str());
+            app_control_destroy(passed);
+        } else {
+            ZV_LOGE("the launch request handed over at start is malformed");
+        }
+        unsetenv(kLaunchRequestEnv);
+    }
     return request;
 }
 
@@ -689,15 +711,26 @@ bool is_pipe_or_socket(int fd)
 // extras as --extra arguments. True once the program has been executed.
 bool spawn_service(const std::string &program, app_control_h app_control)
 {
-    std::vector<std::string> args = {program};
-    for (const auto &kv : app_control->extras) {
-        args.push_back("--extra");
-        args.push_back(kv.first + "=" + kv.second);
+    // The extras travel in the environment, which only the user can read (/proc/PID/environ
+    // is private, the command line is not): the access token is among them.
+    size_t size = 0;
+    GBytePtr message(zv_app_launch_message_encode(app_control, &size));
+    if (!message)
+        return false;
+    std::string request = std::string(kLaunchRequestEnv) + "=";
+    static const char hex[] = "0123456789abcdef";
+    for (size_t i = 0; i < size; i++) {
+        request += hex[message.get()[i] >> 4];
+        request += hex[message.get()[i] & 15];
     }
-    std::vector<char *> argv;
-    for (auto &a : args)
-        argv.push_back(&a[0]);
-    argv.push_back(nullptr);
+    std::vector<char *> envp;
+    for (char **e = environ; *e; e++)
+        if (strncmp(*e, kLaunchRequestEnv, strlen(kLaunchRequestEnv)) != 0)
+            envp.push_back(*e);
+    envp.push_back(&request[0]);
+    envp.push_back(nullptr);
+    std::string prog = program;
+    char *argv[] = {&prog[0], nullptr};
     // A caller's output pipe must not be held open by the long-lived service; a terminal or
     // log file on standard error is kept for the service's log.
     bool keep_stderr = !is_pipe_or_socket(STDERR_FILENO);
@@ -730,7 +763,7 @@ bool spawn_service(const std::string &program, app_control_h app_control)
             for (int fd = STDERR_FILENO + 1; fd < 1024; fd++)
                 fcntl(fd, F_SETFD, FD_CLOEXEC);
         }
-        execv(argv[0], argv.data());
+        execve(argv[0], argv, envp.data());
         int err = errno;
         if (write(status_pipe[1], &err, sizeof err) < 0) {
             // Nothing left to report to.

@@ -30,6 +30,9 @@ int main(int argc, char **argv)
     if (const char *ms = getenv("ZV_TEST_HOLD_HISTORY_LOCK_MS"))
         return hold_history_lock(atol(ms));
     ::testing::InitGoogleTest(&argc, argv);
+    // Listing the tests (CTest does it to find them) needs no toolkit.
+    if (::testing::GTEST_FLAG(list_tests))
+        return RUN_ALL_TESTS();
     elm_init(argc, argv);
     int rc = RUN_ALL_TESTS();
     elm_shutdown();
