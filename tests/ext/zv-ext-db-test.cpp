@@ -20,45 +20,7 @@
 namespace
 {
 
-// The log lines of this process go to one file (unless the environment names one already),
-// so that a test can look for the store's messages written since it started.
-class LogFile
-{
-  public:
-    LogFile()
-    {
-        const char *env = getenv("ZV_DLOG_FILE");
-        if (env && *env) {
-            path_ = env;
-            return;
-        }
-        char tmpl[] = "/tmp/zv-db-test-log-XXXXXX";
-        int fd = mkstemp(tmpl);
-        if (fd >= 0)
-            close(fd);
-        path_ = tmpl;
-        owned_ = true;
-        setenv("ZV_DLOG_FILE", path_.c_str(), 1);
-    }
-    ~LogFile()
-    {
-        if (owned_)
-            unlink(path_.c_str());
-    }
-    void mark() { mark_ = zv_test::read_file(path_).size(); }
-    bool logged(const std::string &text) const
-    {
-        std::string all = zv_test::read_file(path_);
-        return all.size() > mark_ && all.find(text, mark_) != std::string::npos;
-    }
-
-  private:
-    std::string path_;
-    size_t mark_ = 0;
-    bool owned_ = false;
-};
-
-LogFile g_log;
+zv_test::LogFile g_log;
 
 // A connection of the test's own, as the companion process would hold one.
 class RawDb

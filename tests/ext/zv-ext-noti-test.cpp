@@ -17,44 +17,7 @@
 namespace
 {
 
-class LogFile
-{
-  public:
-    // Keeps a log file named by the environment; else uses (and later removes) its own.
-    LogFile()
-    {
-        const char *env = getenv("ZV_DLOG_FILE");
-        if (env && *env) {
-            path_ = env;
-            return;
-        }
-        char tmpl[] = "/tmp/zv-noti-test-log-XXXXXX";
-        int fd = mkstemp(tmpl);
-        if (fd >= 0)
-            close(fd);
-        path_ = tmpl;
-        owned_ = true;
-        setenv("ZV_DLOG_FILE", path_.c_str(), 1);
-    }
-    ~LogFile()
-    {
-        if (owned_)
-            unlink(path_.c_str());
-    }
-    void mark() { mark_ = zv_test::read_file(path_).size(); }
-    bool logged(const std::string &text) const
-    {
-        std::string all = zv_test::read_file(path_);
-        return all.size() > mark_ && all.find(text, mark_) != std::string::npos;
-    }
-
-  private:
-    std::string path_;
-    size_t mark_ = 0;
-    bool owned_ = false;
-};
-
-LogFile g_log;
+zv_test::LogFile g_log;
 
 const char kOngoing[] = "zuvo_ongoing_noti";
 const char kComplete[] = "zuvo_complete_noti";

@@ -27,22 +27,7 @@ namespace
 using zv_test::wait_for;
 constexpr int kWaitMs = 20000;
 
-// The log of this program goes to a file of its own, so that a test can read what the
-// engine wrote. Set before anything logs (the log opens its file at its first line).
-struct LogFile {
-    std::string path;
-    LogFile()
-    {
-        char tmpl[] = "/tmp/zv-curl-test-log-XXXXXX";
-        int fd = mkstemp(tmpl);
-        if (fd >= 0)
-            close(fd);
-        path = tmpl;
-        if (!getenv("ZV_DLOG_FILE"))
-            setenv("ZV_DLOG_FILE", path.c_str(), 1);
-    }
-    ~LogFile() { unlink(path.c_str()); }
-} g_log;
+zv_test::LogFile g_log;
 
 const std::string kReset = "<reset>"; // answer: close the connection with a TCP reset
 const std::string kHang = "<hang>";   // answer: say nothing until the server is destroyed
@@ -410,7 +395,7 @@ TEST_F(EngineTest, PostSendsHeadersAndBodyAndGetsTheRawAnswer)
 
 TEST_F(EngineTest, VerboseLogMasksCredentials)
 {
-    if (std::string(getenv("ZV_DLOG_FILE")) != g_log.path)
+    if (std::string(getenv("ZV_DLOG_FILE")) != g_log.path())
         GTEST_SKIP() << "the log goes elsewhere";
     LoopbackServer server(answer("200 OK", "", "{}"));
     Outcome o;
@@ -423,7 +408,7 @@ TEST_F(EngineTest, VerboseLogMasksCredentials)
     zv_curl_set_body(item.p, form, static_cast<int>(strlen(form)));
     exchange(item, o);
     EXPECT_NE(server.requests().at(0).find("SECRET-5"), std::string::npos);
-    std::string log = zv_test::read_file(g_log.path);
+    std::string log = zv_test::read_file(g_log.path());
     EXPECT_NE(log.find("POST /o/oauth2/token HTTP/1.1"), std::string::npos);
     EXPECT_NE(log.find("Authorization: ****"), std::string::npos);
     EXPECT_NE(log.find("X-ZvData-Key: ****"), std::string::npos);

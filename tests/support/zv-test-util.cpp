@@ -127,4 +127,32 @@ bool write_file(const std::string &path, const std::string &data)
     return (bool)out;
 }
 
+LogFile::LogFile()
+{
+    const char *env = getenv("ZV_DLOG_FILE");
+    if (env && *env) {
+        path_ = env;
+        return;
+    }
+    char tmpl[] = "/tmp/zv-test-log-XXXXXX";
+    int fd = mkstemp(tmpl);
+    if (fd >= 0)
+        close(fd);
+    path_ = tmpl;
+    owned_ = true;
+    setenv("ZV_DLOG_FILE", path_.c_str(), 1);
+}
+
+LogFile::~LogFile()
+{
+    if (owned_)
+        unlink(path_.c_str());
+}
+
+std::string LogFile::since_mark() const
+{
+    std::string all = read_file(path_);
+    return all.size() > mark_ ? all.substr(mark_) : std::string();
+}
+
 } // namespace zv_test

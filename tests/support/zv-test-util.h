@@ -42,4 +42,22 @@ int run_program(const std::vector<std::string> &argv, const std::string &input =
 std::string read_file(const std::string &path);
 bool write_file(const std::string &path, const std::string &data);
 
+// The log lines of this process go to one file (unless the environment names one already),
+// so that a test can look for what was written since its mark. Made before anything logs:
+// the log opens its file at its first line.
+class LogFile {
+public:
+    LogFile();
+    ~LogFile();
+    const std::string &path() const { return path_; }
+    void mark() { mark_ = read_file(path_).size(); }
+    std::string since_mark() const;
+    bool logged(const std::string &text) const { return since_mark().find(text) != std::string::npos; }
+
+private:
+    std::string path_;
+    size_t mark_ = 0;
+    bool owned_ = false;
+};
+
 } // namespace zv_test

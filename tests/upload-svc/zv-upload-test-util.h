@@ -52,43 +52,7 @@ inline bool run_until(const std::function<bool()> &pred, int timeout_ms = 5000,
     return pred();
 }
 
-// The log lines of this process go to one file (unless the environment names one already),
-// so that a test can look for the lines written since its mark.
-class LogFile
-{
-  public:
-    LogFile()
-    {
-        const char *env = getenv("ZV_DLOG_FILE");
-        if (env && *env) {
-            path_ = env;
-            return;
-        }
-        char tmpl[] = "/tmp/zv-ctrl-test-log-XXXXXX";
-        int fd = mkstemp(tmpl);
-        if (fd >= 0)
-            close(fd);
-        path_ = tmpl;
-        owned_ = true;
-        setenv("ZV_DLOG_FILE", path_.c_str(), 1);
-    }
-    ~LogFile()
-    {
-        if (owned_)
-            unlink(path_.c_str());
-    }
-    void mark() { mark_ = zv_test::read_file(path_).size(); }
-    bool logged(const std::string &text) const
-    {
-        std::string all = zv_test::read_file(path_);
-        return all.size() > mark_ && all.find(text, mark_) != std::string::npos;
-    }
-
-  private:
-    std::string path_;
-    size_t mark_ = 0;
-    bool owned_ = false;
-};
+using LogFile = zv_test::LogFile;
 
 inline bool add_row(int historyid, int status, double date, const char *filename,
                     const char *title = "Clip", const char *url = nullptr, int percent = 0)
