@@ -1,13 +1,13 @@
 // Tests of zuvo-devserver: the built program is started on a free port with its storage and
-// request log in a temporary folder, and spoken to with libcurl.
+// request log in a temporary folder, and spoken to with libcurl. What the service's requests
+// meet (resumable uploads, status queries, cuts, oversized answers, the request log, account
+// and category answers) is checked where the client and the service talk to it; here: its
+// command line, its checks of token and key, counting without storing, and faults set by
+// an admin request.
 #include <curl/curl.h>
 #include <glib.h>
 #include <gtest/gtest.h>
-#include <libxml/parser.h>
-#include <libxml/tree.h>
-#include <netinet/in.h>
 #include <signal.h>
-#include <sys/socket.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
@@ -90,15 +90,6 @@ std::string header(const Reply &r, const std::string &name)
         return "";
     at += name.size() + 4;
     return r.headers.substr(at, r.headers.find("\r\n", at) - at);
-}
-
-std::string sha256(const std::string &data)
-{
-    gchar *hex = g_compute_checksum_for_data(G_CHECKSUM_SHA256, reinterpret_cast<const guchar *>(data.data()),
-                                             data.size());
-    std::string out = hex;
-    g_free(hex);
-    return out;
 }
 
 std::string pattern(size_t n)
@@ -250,66 +241,6 @@ TEST_F(DevServerTest, MetadataUploadChecksTokenAndKeyAndNamesTheAddress)
     EXPECT_EQ(meta("zv-dev-access-token").status, 201);
 }
 
-TEST_F(DevServerTest, UploadInTwoPiecesWithStatusQueries)
-{
-    start();
-    const std::string data = pattern(10000);
-    std::string url = new_upload();
-
-    Reply empty = query(url);
-    EXPECT_EQ(empty.status, 308);
-    EXPECT_EQ(header(empty, "Range"), "");
-
-    Reply first = put(url, "bytes 0-4095/10000", data.substr(0, 4096));
-    EXPECT_EQ(first.status, 308);
-    EXPECT_EQ(header(first, "Range"), "bytes=0-4095");
-    Reply held = query(url);
-    EXPECT_EQ(held.status, 308);
-    EXPECT_EQ(header(held, "Range"), "bytes=0-4095");
-
-    // Only the next byte the upload lacks may start a piece.
-    for (const char *range : {"bytes 4000-9999/10000", "bytes 5000-9999/10000"}) {
-        std::string from = std::string(range).substr(6, 4);
-        Reply refused = put(url, range, data.substr(std::stoul(from)));
-        EXPECT_EQ(refused.status, 416) << range;
-    }
-    EXPECT_EQ(header(query(url), "Range"), "bytes=0-4095");
-
-    Reply last = put(url, "bytes 4096-9999/10000", data.substr(4096));
-    EXPECT_EQ(last.status, 201);
-    std::string id = url.substr(url.rfind('/') + 1);
-    EXPECT_EQ(header(last, "ETag"), "\"" + id + "\"");
-    Reply done = query(url);
-    EXPECT_EQ(done.status, 200);
-    EXPECT_EQ(header(done, "ETag"), "\"" + id + "\"");
-
-    EXPECT_EQ(zv_test::read_file(dir_.file("store/" + id + ".data")), data);
-    std::string listing = request("GET", base_ + "/_admin/uploads").body;
-    EXPECT_NE(listing.find("\"id\":\"" + id + "\""), std::string::npos) << listing;
-    EXPECT_NE(listing.find("\"held\":10000,\"complete\":true"), std::string::npos) << listing;
-    EXPECT_NE(listing.find("\"sha256\":\"" + sha256(data) + "\""), std::string::npos) << listing;
-}
-
-TEST_F(DevServerTest, CutPutKeepsTheBytesThatArrivedAndResumes)
-{
-    start();
-    const std::string data = pattern(300000);
-    std::string url = new_upload();
-    ASSERT_EQ(admin_fault("kind=data&action=cut&bytes=123456").status, 201);
-
-    Reply cut = put(url, "bytes 0-299999/300000", data);
-    EXPECT_NE(cut.code, CURLE_OK);
-    EXPECT_EQ(cut.status, 0);
-    EXPECT_EQ(header(query(url), "Range"), "bytes=0-123455");
-    EXPECT_TRUE(zv_test::wait_for([&] { return !find_log({"\"outcome\":\"cut\""}).empty(); }));
-    EXPECT_NE(find_log({"\"outcome\":\"cut\""}).find("\"body_length\":123456,"), std::string::npos);
-
-    Reply rest = put(url, "bytes 123456-299999/300000", data.substr(123456));
-    EXPECT_EQ(rest.status, 201);
-    std::string id = url.substr(url.rfind('/') + 1);
-    EXPECT_EQ(zv_test::read_file(dir_.file("store/" + id + ".data")), data);
-}
-
 TEST_F(DevServerTest, DiscardDataCountsBytesWithoutStoringThem)
 {
     start({"--discard-data"});
@@ -355,116 +286,6 @@ TEST_F(DevServerTest, FaultsByAdminRequest)
         << rules;
     EXPECT_EQ(request("DELETE", base_ + "/_admin/faults").status, 200);
     EXPECT_EQ(request("GET", base_ + "/_admin/faults").body, "[]\n");
-}
-
-TEST_F(DevServerTest, OversizedHeaderBlock)
-{
-    start({"--fault", "kind=schema,action=bigheader"});
-    int fd = socket(AF_INET, SOCK_STREAM, 0);
-    ASSERT_GE(fd, 0);
-    sockaddr_in addr{};
-    addr.sin_family = AF_INET;
-    addr.sin_port = htons(static_cast<uint16_t>(port_));
-    addr.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
-    ASSERT_EQ(connect(fd, reinterpret_cast<sockaddr *>(&addr), sizeof addr), 0);
-    std::string req = "GET /schemas/2007 HTTP/1.1\r\nHost: 127.0.0.1\r\n\r\n";
-    ASSERT_EQ(send(fd, req.data(), req.size(), 0), static_cast<ssize_t>(req.size()));
-    std::string got;
-    std::vector<char> buf(1 << 16);
-    ssize_t n;
-    while (got.find("\r\n\r\n") == std::string::npos && (n = recv(fd, buf.data(), buf.size(), 0)) > 0)
-        got.append(buf.data(), static_cast<size_t>(n));
-    close(fd);
-    EXPECT_GT(got.find("\r\n\r\n"), 5242880u);
-    EXPECT_EQ(got.rfind("HTTP/1.1 200 ", 0), 0u);
-}
-
-TEST_F(DevServerTest, RequestLogRecordsHeadersInOrderAndTheBody)
-{
-    start();
-    std::string url = new_upload();
-    const std::string data = pattern(2000);
-    put(url, "bytes 0-1999/2000", data);
-
-    std::string meta_line = find_log({"\"kind\":\"meta\""});
-    ASSERT_FALSE(meta_line.empty());
-    EXPECT_NE(meta_line.find("[\"Content-Type\",\"application/atom+xml; charset=UTF-8\"],[\"ZvData-Version\",\"2\"],"
-                             "[\"Authorization\",\"Bearer T1\"],[\"X-ZvData-Key\",\"key=K1\"],[\"Slug\",\"clip.mp4\"]"),
-              std::string::npos)
-        << meta_line;
-    EXPECT_NE(meta_line.find("\"body\":\"<?xml version=\\\"1.0\\\"?>\\r\\n<entry/>\""), std::string::npos);
-    EXPECT_NE(meta_line.find("\"status\":201,\"outcome\":\"answered\""), std::string::npos);
-
-    std::string data_line = find_log({"\"kind\":\"data\""});
-    ASSERT_FALSE(data_line.empty());
-    EXPECT_NE(data_line.find("\"body_length\":2000,\"body_sha256\":\"" + sha256(data) + "\""), std::string::npos);
-    gchar *b64 = g_base64_encode(reinterpret_cast<const guchar *>(data.data()), data.size());
-    EXPECT_NE(data_line.find(std::string("\"body_base64\":\"") + b64 + "\""), std::string::npos);
-    g_free(b64);
-    EXPECT_NE(data_line.find("\"complete\":true,\"status\":201"), std::string::npos);
-}
-
-TEST_F(DevServerTest, AccountAnswersCarryTheTokenAfterColonSpaceQuote)
-{
-    start({"--user", "me@example.com", "--password", "pw", "--client-id", "cid", "--client-secret", "sec",
-           "--refresh-token", "R1", "--issued-token", "AT-1"});
-    struct Case {
-        const char *path, *form;
-        long status;
-        const char *needle;
-    } cases[] = {
-        {"/accounts/ClientLogin", "Email=me@example.com&Passwd=pw&service=zuvo&source=Halvane", 200, "\"Auth\": \"AT-1\""},
-        {"/accounts/ClientLogin", "Email=me@example.com&Passwd=nope&service=zuvo&source=Halvane", 403, "error"},
-        {"/o/oauth2/token", "client_id=cid&client_secret=sec&refresh_token=R1&grant_type=refresh_token", 200,
-         "{\n  \"access_token\": \"AT-1\""},
-        {"/o/oauth2/token", "client_id=cid&client_secret=sec&refresh_token=R9&grant_type=refresh_token", 400,
-         "\"invalid_grant\""},
-        {"/o/oauth2/token", "client_id=cid&client_secret=bad&refresh_token=R1&grant_type=refresh_token", 401,
-         "\"invalid_client\""},
-    };
-    for (const auto &c : cases) {
-        Reply r = request("POST", base_ + c.path, {"Content-Type:application/x-www-form-urlencoded"}, c.form);
-        EXPECT_EQ(r.status, c.status) << c.form;
-        EXPECT_NE(r.body.find(c.needle), std::string::npos) << r.body;
-        if (c.status == 200) {
-            EXPECT_EQ(r.body.find("error"), std::string::npos) << r.body;
-        }
-    }
-}
-
-TEST_F(DevServerTest, CategoryDocumentPerLanguage)
-{
-    start();
-    auto labels = [&](const std::string &query, long *status) {
-        Reply r = request("GET", base_ + "/schemas/2007/categories.cat" + query);
-        *status = r.status;
-        std::vector<std::string> out;
-        xmlDocPtr doc = xmlReadMemory(r.body.data(), static_cast<int>(r.body.size()), "c.xml", nullptr, 0);
-        if (!doc)
-            return out;
-        xmlNodePtr root = xmlDocGetRootElement(doc);
-        EXPECT_STREQ(reinterpret_cast<const char *>(root->name), "categories");
-        for (xmlNodePtr n = root->children; n; n = n->next) {
-            if (n->type != XML_ELEMENT_NODE || strcmp(reinterpret_cast<const char *>(n->name), "category") != 0)
-                continue;
-            xmlChar *label = xmlGetProp(n, reinterpret_cast<const xmlChar *>("label"));
-            out.push_back(reinterpret_cast<const char *>(label));
-            xmlFree(label);
-        }
-        xmlFreeDoc(doc);
-        return out;
-    };
-    long status = 0;
-    std::vector<std::string> en = labels("", &status);
-    EXPECT_EQ(status, 200);
-    ASSERT_EQ(en.size(), 15u);
-    EXPECT_EQ(en[0], "Film & Animation");
-    std::vector<std::string> ko = labels("?hl=ko_KR", &status);
-    ASSERT_EQ(ko.size(), 15u);
-    EXPECT_EQ(ko[2], "음악");
-    EXPECT_EQ(labels("?hl=de-DE", &status)[2], "Musik");
-    labels("?hl=xx", &status);
-    EXPECT_EQ(status, 404);
 }
 
 } // namespace
