@@ -350,6 +350,28 @@ int zv_set_attr_gps(ServiceRequest *zv_handle, double latitude, double longitude
     return ZV_ERROR_NONE;
 }
 
+
+// The handle's new transfer, or NULL (logged).
+static TransferItem *new_transfer(ServiceRequest *zv_handle)
+{
+    if (zv_curl_new(&zv_handle->transfer) != ZV_CURL_ERROR_NONE || !zv_handle->transfer) {
+        ZV_LOGE("curl item handle create fail");
+        return nullptr;
+    }
+    return zv_handle->transfer;
+}
+
+// The result of building and queueing a transfer: a transfer that could not be built or
+// queued is released.
+static int queued(TransferItem *item, bool ok)
+{
+    if (!ok) {
+        zv_curl_free(item);
+        return ZV_ERROR_REQUEST_FAIL;
+    }
+    return ZV_ERROR_NONE;
+}
+
 int zv_request_meta_upload(ServiceRequest *zv_handle)
 {
     ZV_LOG_ENTER();
@@ -375,11 +397,9 @@ int zv_request_meta_upload(ServiceRequest *zv_handle)
     }
 
     char header[HEADER_BUF_SIZE] = {0};
-    if (zv_curl_new(&zv_handle->transfer) != ZV_CURL_ERROR_NONE || !zv_handle->transfer) {
-        ZV_LOGE("curl item handle create fail");
+    TransferItem *item = new_transfer(zv_handle);
+    if (!item)
         return ZV_ERROR_REQUEST_FAIL;
-    }
-    TransferItem *item = zv_handle->transfer;
 
     GText permission;
     bool is_private = false;
@@ -459,11 +479,7 @@ int zv_request_meta_upload(ServiceRequest *zv_handle)
          CURL_OK(zv_curl_set_body, item, document.get(), document_len) &&
          CURL_OK(zv_curl_send_request, item);
     explicit_bzero(header, sizeof header);
-    if (!ok) {
-        zv_curl_free(item);
-        return ZV_ERROR_REQUEST_FAIL;
-    }
-    return ZV_ERROR_NONE;
+    return queued(item, ok);
 }
 
 int zv_request_data_upload(ServiceRequest *zv_handle)
@@ -483,11 +499,9 @@ int zv_request_data_upload(ServiceRequest *zv_handle)
     }
 
     char header[HEADER_BUF_SIZE] = {0};
-    if (zv_curl_new(&zv_handle->transfer) != ZV_CURL_ERROR_NONE || !zv_handle->transfer) {
-        ZV_LOGE("curl item handle create fail");
+    TransferItem *item = new_transfer(zv_handle);
+    if (!item)
         return ZV_ERROR_REQUEST_FAIL;
-    }
-    TransferItem *item = zv_handle->transfer;
 
     const char *media_type = zv_plugin_util_get_file_mime(zv_handle->file_path);
     if (!media_type)
@@ -513,11 +527,7 @@ int zv_request_data_upload(ServiceRequest *zv_handle)
               CURL_OK(zv_curl_set_connect_timeout, item, 30000) && CURL_USER_AGENT(item, agent) &&
               CURL_OK(zv_curl_set_file_info, item, zv_handle->file_path, size, offset) &&
               CURL_OK(zv_curl_send_request, item);
-    if (!ok) {
-        zv_curl_free(item);
-        return ZV_ERROR_REQUEST_FAIL;
-    }
-    return ZV_ERROR_NONE;
+    return queued(item, ok);
 }
 
 int zv_request_upload_query(ServiceRequest *zv_handle)
@@ -532,11 +542,9 @@ int zv_request_upload_query(ServiceRequest *zv_handle)
         ZV_LOGE("upload_url data is NULL");
         return ZV_ERROR_INVALID_URL;
     }
-    if (zv_curl_new(&zv_handle->transfer) != ZV_CURL_ERROR_NONE || !zv_handle->transfer) {
-        ZV_LOGE("curl item handle create fail");
+    TransferItem *item = new_transfer(zv_handle);
+    if (!item)
         return ZV_ERROR_REQUEST_FAIL;
-    }
-    TransferItem *item = zv_handle->transfer;
     zv_handle->resp_type = ZV_RESP_TYPE_UPLOAD_QUERY;
     GText agent = user_agent_text();
 
@@ -553,11 +561,7 @@ int zv_request_upload_query(ServiceRequest *zv_handle)
               CURL_OK(zv_curl_set_timeout, item, 30000) &&
               CURL_OK(zv_curl_set_connect_timeout, item, 30000) && CURL_USER_AGENT(item, agent) &&
               CURL_OK(zv_curl_send_request, item);
-    if (!ok) {
-        zv_curl_free(item);
-        return ZV_ERROR_REQUEST_FAIL;
-    }
-    return ZV_ERROR_NONE;
+    return queued(item, ok);
 }
 
 int zv_request_login(ServiceRequest *zv_handle)
@@ -577,11 +581,9 @@ int zv_request_login(ServiceRequest *zv_handle)
     }
 
     char body[LOGIN_BODY_SIZE] = {0};
-    if (zv_curl_new(&zv_handle->transfer) != ZV_CURL_ERROR_NONE || !zv_handle->transfer) {
-        ZV_LOGE("curl item handle create fail");
+    TransferItem *item = new_transfer(zv_handle);
+    if (!item)
         return ZV_ERROR_REQUEST_FAIL;
-    }
-    TransferItem *item = zv_handle->transfer;
     snprintf(body, sizeof body, "Email=%s&Passwd=%s&service=zuvo&source=Halvane",
              zv_handle->user_id, zv_handle->user_pwd);
     zv_handle->resp_type = ZV_RESP_TYPE_LOGIN;
@@ -599,11 +601,7 @@ int zv_request_login(ServiceRequest *zv_handle)
               CURL_OK(zv_curl_set_body, item, body, (int)strlen(body)) &&
               CURL_OK(zv_curl_send_request, item);
     explicit_bzero(body, sizeof body);
-    if (!ok) {
-        zv_curl_free(item);
-        return ZV_ERROR_REQUEST_FAIL;
-    }
-    return ZV_ERROR_NONE;
+    return queued(item, ok);
 }
 
 int zv_request_get_token(ServiceRequest *zv_handle)
@@ -617,11 +615,9 @@ int zv_request_get_token(ServiceRequest *zv_handle)
         ZV_LOGE("refresh toekn is NULL");
         return ZV_ERROR_INVALID_TOKEN;
     }
-    if (zv_curl_new(&zv_handle->transfer) != ZV_CURL_ERROR_NONE || !zv_handle->transfer) {
-        ZV_LOGE("curl item handle create fail");
+    TransferItem *item = new_transfer(zv_handle);
+    if (!item)
         return ZV_ERROR_REQUEST_FAIL;
-    }
-    TransferItem *item = zv_handle->transfer;
     zv_handle->resp_type = ZV_RESP_TYPE_GET_TOKEN;
 
     GText url = service_address("https", "ZV_TOKEN_HOST", DEFAULT_TOKEN_HOST, "/o/oauth2/token");
@@ -653,11 +649,7 @@ int zv_request_get_token(ServiceRequest *zv_handle)
     ok = CURL_OK(zv_curl_set_body, item, body, (int)strlen(body)) &&
          CURL_OK(zv_curl_send_request, item);
     explicit_bzero(body, sizeof body);
-    if (!ok) {
-        zv_curl_free(item);
-        return ZV_ERROR_REQUEST_FAIL;
-    }
-    return ZV_ERROR_NONE;
+    return queued(item, ok);
 }
 
 // Pause, resume and cancel share one shape: handle and transfer checks, then the engine call.
