@@ -77,7 +77,7 @@ if [[ " $stages " == *" tsan "* ]]; then
     zuvo-upload-svc zuvo-devserver zuvo-client zv-vconf zv-keystore zv_resources
   TSAN_OPTIONS="halt_on_error=1:second_deadlock_stack=1:suppressions=$top/tests/sanitizers/tsan.supp" \
     run_suite "thread: engine, client, controller" build-tsan \
-    -R '^(Engine|ClientTest|AccountTest|CategoryListTest|RunningUploadTest|UploadCtrlTest|UploadListTest|CtrlE2ETest|ServiceE2ETest)'
+    -R '^(Engine|ClientTest|AccountTest|CategoryListTest|RunningUploadTest|UploadCtrlTest|UploadListTest|CtrlE2ETest|ServiceE2ETest|Failures/ServiceFailureTest)'
 fi
 
 if [[ " $stages " == *" fuzz "* ]] && [ -x scripts/fuzz.sh ]; then
