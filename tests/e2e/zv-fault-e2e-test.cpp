@@ -109,7 +109,7 @@ TEST_F(FaultE2ETest, DataUploadCutAtTwentyOffsets)
         ASSERT_TRUE(run_until([&] { return server_.fired("cut") == cut + 2; }, kLongWaitMs));
     }
     EXPECT_GE(server_.fired("cut"), 20);
-    finish(id, "20 cuts of the data upload", 20);
+    finish(id, ("20 cuts of the data upload, seed " + std::to_string(seed)).c_str(), 20);
 }
 
 TEST_F(FaultE2ETest, StatusQueryRefusedWith500)
