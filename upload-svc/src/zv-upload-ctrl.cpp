@@ -283,30 +283,10 @@ int parse_offset(const char *value)
     return n > INT_MAX ? INT_MAX : (int)n;
 }
 
-// The catalogue's plural title must hold exactly one integer conversion; a translation
-// that does not is not used as a format.
-bool has_one_int_conversion(const char *fmt)
-{
-    int count = 0;
-    for (const char *p = fmt; *p; p++) {
-        if (*p != '%')
-            continue;
-        p++;
-        if (*p == '%')
-            continue;
-        while (*p && strchr("-+ #0123456789", *p))
-            p++;
-        if (*p != 'd' && *p != 'i')
-            return false;
-        count++;
-    }
-    return count == 1;
-}
-
 char *plural_title(int completed)
 {
     const char *fmt = i18n_get_text(text("IDS_MF_BODY_PD_FILES"));
-    if (!fmt || !has_one_int_conversion(fmt))
+    if (!fmt || !zv_ext_util_is_count_format(fmt))
         return g_strdup_printf("%d", completed);
     return g_strdup_printf(fmt, completed);
 }

@@ -219,25 +219,6 @@ Evas_Object *unset_title_button(Elm_Object_Item *item, const char *part, const c
     return btn;
 }
 
-// True when fmt holds exactly one conversion and it takes an int ("%d" or "%i").
-bool is_count_format(const char *fmt)
-{
-    int conversions = 0;
-    for (const char *p = fmt; *p; p++) {
-        if (*p != '%')
-            continue;
-        p++;
-        if (*p == '%')
-            continue;
-        while (*p && strchr("0123456789-+ #$", *p))
-            p++;
-        if (*p != 'd' && *p != 'i')
-            return false;
-        conversions++;
-    }
-    return conversions == 1;
-}
-
 // The edit title for a selection count; with set_done the Done button is enabled exactly
 // while the count is not 0.
 void update_edit_title(int count, bool set_done = true)
@@ -249,7 +230,7 @@ void update_edit_title(int count, bool set_done = true)
         text.reset(g_strdup(tr(IDS_SELECT_UPLOADS)));
     } else {
         const char *fmt = i18n_get_text(tr(IDS_SELECTED));
-        if (!fmt || !is_count_format(fmt)) {
+        if (!fmt || !zv_ext_util_is_count_format(fmt)) {
             ZV_LOGE("bad selected format: %s", fmt ? fmt : "(null)");
             fmt = "%d";
         }

@@ -2,6 +2,7 @@
 #include "zv-ext-util.h"
 
 #include <stdio.h>
+#include <string.h>
 
 #include <memory>
 
@@ -250,4 +251,24 @@ time_t zv_ext_util_generate_id(void)
     struct tm local;
     localtime_r(&now, &local);
     return mktime(&local);
+}
+
+bool zv_ext_util_is_count_format(const char *fmt)
+{
+    if (!fmt)
+        return false;
+    int conversions = 0;
+    for (const char *p = fmt; *p; p++) {
+        if (*p != '%')
+            continue;
+        p++;
+        if (*p == '%')
+            continue;
+        while (*p && strchr("0123456789-+ #$", *p))
+            p++;
+        if (*p != 'd' && *p != 'i')
+            return false;
+        conversions++;
+    }
+    return conversions == 1;
 }

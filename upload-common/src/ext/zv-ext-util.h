@@ -44,3 +44,6 @@ Evas_Object *zv_ext_util_create_account_select_popup(Evas_Object *parent, const 
 int zv_ext_util_get_file_size(const char *path);
 // The current local calendar time as an id; two ids of the same second are equal.
 time_t zv_ext_util_generate_id(void);
+// True when a translated format holds exactly one conversion and it takes an int ("%d",
+// "%i", with flags and width): only then may a count be printed with it.
+bool zv_ext_util_is_count_format(const char *fmt);
