@@ -147,8 +147,8 @@ TEST_F(FaultE2ETest, AnswerHeaderOverTheLimit)
 
 TEST_F(FaultE2ETest, HistoryLockedLongerThanTheBusyHandlerWaits)
 {
-    // Progress is reported (and stored) once per 2 MiB read: a slow 12 MB upload stores
-    // every second or so.
+    // Progress is reported (and stored) once per 512 KiB read: a slow 12 MB upload stores
+    // several times a second.
     int id = start_one(12000000, {"kind=data,action=throttle,rate=1500000,times=0"});
     ASSERT_TRUE(run_until([&] { return stored_rows()[id].percent > 0; }, kLongWaitMs));
     g_log.mark();
