@@ -78,6 +78,12 @@ if [[ " $stages " == *" tsan "* ]]; then
   TSAN_OPTIONS="halt_on_error=1:second_deadlock_stack=1:suppressions=$top/tests/sanitizers/tsan.supp" \
     run_suite "thread: engine, client, controller" build-tsan \
     -R '^(Engine|ClientTest|AccountTest|CategoryListTest|RunningUploadTest|UploadCtrlTest|UploadListTest|CtrlE2ETest|ServiceE2ETest|Failures/ServiceFailureTest)'
+  # The stress test again with two more seeds (each run prints its seed in the report).
+  for seed in ${ZV_STRESS_SEEDS:-7 4242}; do
+    ZV_STRESS_SEED=$seed \
+    TSAN_OPTIONS="halt_on_error=1:second_deadlock_stack=1:suppressions=$top/tests/sanitizers/tsan.supp" \
+      run_suite "thread: stress, seed $seed" build-tsan -R 'CtrlE2ETest.Stress'
+  done
 fi
 
 if [[ " $stages " == *" fuzz "* ]] && [ -x scripts/fuzz.sh ]; then

@@ -164,6 +164,7 @@ TEST_F(ZuvoClientTest, WrongCallsExitTwoAndRecordNothing)
     ASSERT_EQ(mkfifo(tmp_.file("fifo").c_str(), 0600), 0);
     ASSERT_TRUE(zv_test::write_file(tmp_.file("big.mp4"), ""));
     ASSERT_EQ(truncate(tmp_.file("big.mp4").c_str(), 2147483648LL), 0); // sparse
+    ASSERT_TRUE(zv_test::write_file(tmp_.file("empty.mp4"), ""));
     std::vector<std::vector<std::string>> calls = {
         {},
         {"frob"},
@@ -174,6 +175,7 @@ TEST_F(ZuvoClientTest, WrongCallsExitTwoAndRecordNothing)
         {"add", "good.mp4", "folder"},
         {"add", "good.mp4", "fifo"},
         {"add", "good.mp4", "big.mp4"},
+        {"add", "good.mp4", "empty.mp4"},
         {"add", "--title", "a", "--title", "b", "good.mp4"},
         {"list", "extra"},
         {"remove"},

@@ -4,8 +4,12 @@
 // host points at a closed local port, so nothing leaves the machine.
 #include "zv-upload-ctrl.h"
 
+#include <arpa/inet.h>
 #include <fcntl.h>
 #include <gtest/gtest.h>
+#include <netinet/in.h>
+#include <sqlite3.h>
+#include <sys/socket.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
@@ -18,6 +22,31 @@
 
 namespace
 {
+
+// A local port that takes connections and never answers: a request sent there stays in
+// flight, and the test answers it in the worker's place, in the order it chooses.
+class SilentServer
+{
+  public:
+    SilentServer()
+    {
+        fd_ = socket(AF_INET, SOCK_STREAM | SOCK_CLOEXEC, 0);
+        sockaddr_in addr = {};
+        addr.sin_family = AF_INET;
+        addr.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
+        socklen_t len = sizeof addr;
+        if (bind(fd_, reinterpret_cast<sockaddr *>(&addr), len) == 0 && listen(fd_, 64) == 0 &&
+            getsockname(fd_, reinterpret_cast<sockaddr *>(&addr), &len) == 0)
+            host_ = "127.0.0.1:" + std::to_string(ntohs(addr.sin_port));
+    }
+    ~SilentServer() { close(fd_); }
+    const std::string &host() const { return host_; }
+    std::string url(int id) const { return "http://" + host_ + "/upload/" + std::to_string(id); }
+
+  private:
+    int fd_ = -1;
+    std::string host_;
+};
 
 using zv_upload_test::add_row;
 using zv_upload_test::notification;
@@ -74,8 +103,70 @@ class UploadCtrlTest : public ::testing::Test
         EXPECT_TRUE(zv_test::write_file(path, std::string(bytes, 'v')));
         return path;
     }
+    // Metadata uploads go to the silent server.
+    void use_silent_server()
+    {
+        setenv("ZV_UPLOAD_HOST", silent_.host().c_str(), 1);
+        ASSERT_EQ(zv_test::run_program({zv_test::bin_path("zv-keystore"), "set",
+                                        "zuvo.tizen.api.key"},
+                                       "key"),
+                  0);
+    }
+    // The answer of the job's current request, as the worker reports it.
+    void answer(UploadItem *job_item, int type, int result, const char *value = nullptr)
+    {
+        ServiceResponse resp = {};
+        resp.handle = job_item->handle;
+        resp.resp_type = type;
+        resp.http_code = result == ZV_ERROR_NONE ? 201 : 500;
+        resp.value = const_cast<char *>(value);
+        _zv_upload_ctrl_resp_cb(result, &resp, &ad_);
+    }
+    void deliver(Ecore_Pipe_Cb handler, int historyid)
+    {
+        PipeMessage msg = {historyid, 0};
+        handler(&ad_, &msg, sizeof msg);
+    }
+    // Hands every message already in the pipes to its handler, and runs the idlers added
+    // so far.
+    void drain()
+    {
+        bool idled = false;
+        ecore_idler_add(
+            [](void *data) -> Eina_Bool {
+                *static_cast<bool *>(data) = true;
+                return ECORE_CALLBACK_CANCEL;
+            },
+            &idled);
+        ASSERT_TRUE(zv_upload_test::run_until([&] { return idled; }));
+        for (int i = 0; i < 3; i++)
+            ecore_main_loop_iterate();
+    }
+    // A PAUSED row whose upload again is under way, its status query out to the silent server.
+    UploadItem *querying(int historyid)
+    {
+        std::string file = video("v" + std::to_string(historyid) + ".mp4", 1000);
+        EXPECT_TRUE(add_row(historyid, ZV_UPLOAD_STATUS_PAUSED, historyid, file.c_str(), "Clip",
+                            silent_.url(historyid).c_str()));
+        zv_upload_list_load_full_item(&ad_); // takes only the rows that are not jobs yet
+        UploadItem *j = job(historyid);
+        ad_.resume_upload(&ad_, j);
+        drain();
+        return j;
+    }
+    // ... then answered with the server's count: its data upload is out, and running.
+    UploadItem *sending(int historyid)
+    {
+        UploadItem *j = querying(historyid);
+        answer(j, ZV_RESP_TYPE_UPLOAD_QUERY, ZV_ERROR_NONE, "99");
+        drain();
+        _zv_upload_ctrl_progress_cb(j->handle, 10, &ad_);
+        drain();
+        return j;
+    }
 
     zv_test::TempDir dir_;
+    SilentServer silent_;
     AppData ad_ = {};
     bool started_ = false;
 };
@@ -219,16 +310,25 @@ TEST_F(UploadCtrlTest, RowsThatCannotBeSentEndPausedAndSayWhy)
                 return false;
         return true;
     }));
+    // A row without a title or file name fails at its setter, with the setter's message; a
+    // file that cannot be sent is named with the reason. Only the good row sends anything.
     EXPECT_TRUE(g_log.logged("file of 1 is missing: " + missing));
-    EXPECT_TRUE(g_log.logged("file of 2 is empty: " + empty));
+    EXPECT_TRUE(g_log.logged("file of 2 is empty, nothing to upload: " + empty));
     EXPECT_TRUE(g_log.logged("file of 3 is 2 GiB or more"));
-    EXPECT_TRUE(g_log.logged("file name of 4 is NULL"));
-    EXPECT_TRUE(g_log.logged("title of 5 is NULL"));
+    EXPECT_TRUE(g_log.logged("zv_set_attr_file_path fail: -988"));
+    EXPECT_TRUE(g_log.logged("zv_set_attr_title fail: -993"));
     EXPECT_TRUE(g_log.logged("file of 6 is not a regular file"));
-    EXPECT_TRUE(g_log.logged("zv_request_meta_upload fail: -982"));
-    for (int id = 1; id <= 6; id++)
-        EXPECT_EQ(job(id)->handle, nullptr) << "no request was made for " << id;
-    EXPECT_NE(job(7)->handle, nullptr);
+    std::string log = g_log.since_mark();
+    const std::string sent = "zv_request_meta_upload fail: -982";
+    ASSERT_NE(log.find(sent), std::string::npos);
+    EXPECT_EQ(log.find(sent), log.rfind(sent)) << "one metadata upload was tried";
+
+    // Upload again on the empty file says why again and sends nothing.
+    g_log.mark();
+    ad_.resume_upload(&ad_, job(2));
+    EXPECT_TRUE(g_log.logged("file of 2 is empty, nothing to upload: " + empty));
+    EXPECT_FALSE(g_log.logged("zv_request_upload_query"));
+    EXPECT_EQ(job(2)->status, ZV_UPLOAD_STATUS_PAUSED);
 }
 
 TEST_F(UploadCtrlTest, CompletedJobsIgnorePauseAndResume)
@@ -246,7 +346,8 @@ TEST_F(UploadCtrlTest, CompletedJobsIgnorePauseAndResume)
 
 TEST_F(UploadCtrlTest, UploadAgainWithoutAddressStaysPaused)
 {
-    ASSERT_TRUE(add_row(1, ZV_UPLOAD_STATUS_PAUSED, 1, "/v/1", "Never sent", nullptr, 0));
+    std::string file = video("never.mp4", 10);
+    ASSERT_TRUE(add_row(1, ZV_UPLOAD_STATUS_PAUSED, 1, file.c_str(), "Never sent", nullptr, 0));
     start();
     UploadItem *paused = job(1);
     ad_.resume_upload(&ad_, paused);
@@ -271,6 +372,176 @@ TEST_F(UploadCtrlTest, DeleteRemovesTheJobAndOnRequestItsRow)
     auto rows = stored_rows();
     EXPECT_EQ(rows.count(1), 0u);
     EXPECT_EQ(rows.count(2), 1u);
+}
+
+TEST_F(UploadCtrlTest, PauseBeforeTheUploadMessageKeepsTheJobPausedAndOneAnswerStartsOneUpload)
+{
+    use_silent_server();
+    std::string file = video("a.mp4", 1000);
+    ASSERT_TRUE(add_row(1, ZV_UPLOAD_STATUS_READY, 1, file.c_str()));
+    start();
+    launch();
+    drain();
+    UploadItem *a = job(1);
+    ASSERT_EQ(a->status, ZV_UPLOAD_STATUS_WAITING);
+    ServiceRequest *meta = a->handle;
+    ASSERT_NE(meta, nullptr);
+
+    // The metadata answer, then a network event before the upload message is read.
+    answer(a, ZV_RESP_TYPE_META_UPLOAD, ZV_ERROR_NONE, silent_.url(1).c_str());
+    _zv_upload_ctrl_net_status_cb(2, &ad_);
+    drain();
+    EXPECT_EQ(a->status, ZV_UPLOAD_STATUS_PAUSED);
+    EXPECT_EQ(a->handle, meta) << "no data upload was started";
+    EXPECT_EQ(stored_rows()[1].status, ZV_UPLOAD_STATUS_PAUSED);
+    EXPECT_EQ(stored_rows()[1].url, silent_.url(1)) << "the address is kept";
+
+    // A launch request leaves a paused job alone.
+    launch();
+    drain();
+    EXPECT_EQ(a->handle, meta);
+
+    // Upload again: the query's answer starts one data upload from its count, however many
+    // upload messages are read.
+    ad_.resume_upload(&ad_, a);
+    drain();
+    ServiceRequest *query = a->handle;
+    ASSERT_NE(query, meta);
+    answer(a, ZV_RESP_TYPE_UPLOAD_QUERY, ZV_ERROR_NONE, "99");
+    deliver(_zv_upload_ctrl_pipe_upload_cb, 1);
+    ServiceRequest *data = a->handle;
+    EXPECT_NE(data, query);
+    EXPECT_EQ(a->offset, 99);
+    deliver(_zv_upload_ctrl_pipe_upload_cb, 1);
+    drain();
+    EXPECT_EQ(a->handle, data) << "a second upload message crossed the running upload";
+
+    // A launch request leaves the running upload alone too.
+    launch();
+    drain();
+    EXPECT_EQ(a->handle, data);
+}
+
+TEST_F(UploadCtrlTest, CompletionIsCountedOnceWhicheverPipeIsReadFirst)
+{
+    i18n_bind_text_domain();
+    use_silent_server();
+    start();
+    launch();
+    const std::string complete_file = run_dir() + "/notifications/zuvo_complete_noti.ini";
+    // The first progress report (change pipe) and the completion (complete pipe) of a one-job
+    // batch, read in both orders.
+    for (int first_complete = 0; first_complete < 2; first_complete++) {
+        SCOPED_TRACE(first_complete ? "complete pipe first" : "change pipe first");
+        int id = 10 + first_complete;
+        unlink(complete_file.c_str());
+        UploadItem *j = querying(id);
+        answer(j, ZV_RESP_TYPE_UPLOAD_QUERY, ZV_ERROR_NONE, "99");
+        drain();
+        _zv_upload_ctrl_progress_cb(j->handle, 100, &ad_);
+        answer(j, ZV_RESP_TYPE_DATA_UPLOAD, ZV_ERROR_NONE);
+        if (first_complete) {
+            deliver(_zv_upload_ctrl_pipe_complete_cb, id);
+            deliver(_zv_upload_ctrl_pipe_change_cb, id);
+        } else {
+            deliver(_zv_upload_ctrl_pipe_change_cb, id);
+            deliver(_zv_upload_ctrl_pipe_complete_cb, id);
+        }
+        drain(); // the pipes' own copies of both messages
+
+        EXPECT_EQ(j->status, ZV_UPLOAD_STATUS_COMPLETED);
+        EXPECT_EQ(stored_rows()[id].status, ZV_UPLOAD_STATUS_COMPLETED);
+        EXPECT_EQ(notification(run_dir(), "zuvo_complete_noti")["title"], "Clip");
+        EXPECT_TRUE(notification(run_dir(), "zuvo_ongoing_noti").empty());
+        EXPECT_EQ(ad_.completed_count, 0);
+    }
+}
+
+TEST_F(UploadCtrlTest, PauseAfterTheCompletionLeavesTheJobCompleted)
+{
+    use_silent_server();
+    start();
+    launch();
+    UploadItem *j = sending(1);
+    ASSERT_EQ(j->status, ZV_UPLOAD_STATUS_UPLOADING);
+    answer(j, ZV_RESP_TYPE_DATA_UPLOAD, ZV_ERROR_NONE);
+    ad_.pause_upload(&ad_, j);
+    EXPECT_TRUE(g_log.logged("Skip for complete item"));
+    drain();
+    EXPECT_EQ(j->status, ZV_UPLOAD_STATUS_COMPLETED);
+    EXPECT_EQ(stored_rows()[1].status, ZV_UPLOAD_STATUS_COMPLETED);
+    EXPECT_FALSE(notification(run_dir(), "zuvo_complete_noti").empty());
+}
+
+TEST_F(UploadCtrlTest, RequestsThatFailAtOnceLeaveTheirJobsPaused)
+{
+    // Upload again against a closed port: each status query is refused at once, however
+    // soon after it was queued, and its job ends PAUSED with nothing in flight.
+    use_silent_server();
+    std::vector<int> ids;
+    for (int id = 1; id <= 8; id++) {
+        std::string file = video("v" + std::to_string(id) + ".mp4", 100);
+        ASSERT_TRUE(add_row(id, ZV_UPLOAD_STATUS_PAUSED, id, file.c_str(), "Clip",
+                            "http://127.0.0.1:9/upload/1"));
+        ids.push_back(id);
+    }
+    start();
+    for (int id : ids)
+        ad_.resume_upload(&ad_, job(id));
+    ASSERT_TRUE(zv_upload_test::run_until([&] {
+        for (int id : ids)
+            if (job(id)->status != ZV_UPLOAD_STATUS_PAUSED ||
+                stored_rows()[id].status != ZV_UPLOAD_STATUS_PAUSED)
+                return false;
+        return true;
+    }));
+
+    // With the engine stopped, every request is refused when it is made.
+    zv_finalize_service();
+    std::string file = video("late.mp4", 100);
+    ASSERT_TRUE(add_row(20, ZV_UPLOAD_STATUS_READY, 20, file.c_str()));
+    g_log.mark();
+    launch();
+    ASSERT_TRUE(zv_upload_test::run_until(
+        [&] { return stored_rows()[20].status == ZV_UPLOAD_STATUS_PAUSED; }));
+    EXPECT_TRUE(g_log.logged("zv_request_meta_upload fail: -998"));
+    ad_.resume_upload(&ad_, job(1));
+    EXPECT_TRUE(g_log.logged("zv_request_upload_query fail: -998"));
+    EXPECT_EQ(job(1)->status, ZV_UPLOAD_STATUS_PAUSED);
+}
+
+TEST_F(UploadCtrlTest, StoresThatFailAreMadeAgainAndARowIsOneJob)
+{
+    use_silent_server();
+    set_network(0);
+    std::string file = video("a.mp4", 100);
+    ASSERT_TRUE(add_row(1, ZV_UPLOAD_STATUS_READY, 1, file.c_str()));
+    start();
+    // Another process holds the history past the store's patience: the row stays READY.
+    sqlite3 *other = nullptr;
+    ASSERT_EQ(sqlite3_open(getenv("ZV_HISTORY_DB"), &other), SQLITE_OK);
+    ASSERT_EQ(sqlite3_exec(other, "BEGIN EXCLUSIVE", nullptr, nullptr, nullptr), SQLITE_OK);
+    launch();
+    launch();
+    int jobs = 0;
+    for (GList *l = ad_.job_list; l; l = l->next)
+        jobs += static_cast<UploadItem *>(l->data)->historyid == 1;
+    EXPECT_EQ(jobs, 1) << "the READY row was loaded once";
+    sqlite3_exec(other, "COMMIT", nullptr, nullptr, nullptr);
+    EXPECT_TRUE(zv_upload_test::run_until(
+        [] { return stored_rows()[1].status == ZV_UPLOAD_STATUS_WAITING; }));
+
+    // A completion stored while the history is held reaches the row once it is free.
+    set_network(2);
+    UploadItem *j = sending(2);
+    answer(j, ZV_RESP_TYPE_DATA_UPLOAD, ZV_ERROR_NONE);
+    ASSERT_EQ(sqlite3_exec(other, "BEGIN EXCLUSIVE", nullptr, nullptr, nullptr), SQLITE_OK);
+    drain();
+    EXPECT_EQ(j->status, ZV_UPLOAD_STATUS_COMPLETED);
+    sqlite3_exec(other, "COMMIT", nullptr, nullptr, nullptr);
+    sqlite3_close(other);
+    EXPECT_TRUE(zv_upload_test::run_until(
+        [] { return stored_rows()[2].status == ZV_UPLOAD_STATUS_COMPLETED; }));
 }
 
 } // namespace

@@ -42,8 +42,9 @@ const char kUsage[] =
     "Commands:\n"
     "  add FILE... [--title T] [--user U]\n"
     "      record each file as a READY upload; prints one line \"ID<TAB>PATH\" per file.\n"
-    "      The title defaults to the file name without its extension. Files of 2 GiB and\n"
-    "      more are refused; nothing is recorded unless every file can be read.\n"
+    "      The title defaults to the file name without its extension. Empty files and\n"
+    "      files of 2 GiB and more are refused; nothing is recorded unless every file can\n"
+    "      be read.\n"
     "  launch --token T --category C [--description D] [--tag T]\n"
     "         [--privacy public|unlisted|private] [--location]\n"
     "      send the service the launch request that uploads every READY file\n"
@@ -249,6 +250,8 @@ int check_file(const std::string &arg, NewFile *file)
     if (fd < 0)
         return complain(kExitUsage, "cannot read '%s': %s", arg.c_str(), strerror(errno));
     ::close(fd);
+    if (st.st_size == 0)
+        return complain(kExitUsage, "'%s' is empty: there is nothing to upload", arg.c_str());
     if (st.st_size > INT_MAX)
         return complain(kExitUsage,
                         "'%s' is %lld bytes: the history records sizes below 2 GiB only",

@@ -40,23 +40,40 @@ struct CtrlPipe {
     std::mutex write_lock;
 };
 
-// What the transfer worker may see of one job: it writes the job's new values here, and
-// the main loop copies them into the UploadItem when it handles the message that follows.
-struct WorkerView {
+// One job as both threads see it. The worker never touches an UploadItem: its callbacks
+// find the job here by its request and change it here, under g_ctrl.lock, and the main loop
+// copies these values into the UploadItem (sync_job) before it acts on a pipe message.
+//
+// status is the job's one true status. Every change of it, on either thread, is made under
+// the lock by a transition that first looks at what it is now, so that no interleaving of
+// the two threads undoes another: a COMPLETED job stays COMPLETED, a PAUSED job is only
+// restarted by the main loop's resume, and an answer of a request that the job no longer
+// holds changes nothing.
+struct JobState {
     int historyid = 0;
-    const ServiceRequest *handle = nullptr; // the job's request in flight
+    const ServiceRequest *handle = nullptr; // the job's current request
     int status = 0;
     int percent = 0;
     int offset = 0;
     bool has_url = false;
     std::string url;
     std::string title;
+    // The request of handle is queued and its answer has not been reported: a launch
+    // request leaves the job to it.
+    bool in_flight = false;
+    // The answer of handle asks for the data upload (upload pipe), which has not started:
+    // the upload handler starts it once, and only for this request.
+    bool upload_due = false;
+    // The data upload was answered with success and the main loop has not counted it yet:
+    // the complete handler counts it, exactly once. Until then the main loop sees the job
+    // UPLOADING, so that no other handler stores or counts it as completed first.
+    bool completion_due = false;
 };
 
 struct CtrlState {
     CtrlPipe pipes[PIPE_COUNT];
-    std::mutex lock; // guards views; held briefly, never across a call into the client
-    std::unordered_map<const UploadItem *, WorkerView> views;
+    std::mutex lock; // guards jobs; held briefly, never across a call into the client
+    std::unordered_map<const UploadItem *, JobState> jobs;
     std::unordered_map<UploadItem *, Ecore_Idler *> idlers; // main loop only
 };
 
@@ -112,28 +129,47 @@ void close_pipe(PipeKind kind)
     }
 }
 
-// Worker: the view of the job whose request is handle. g_ctrl.lock must be held.
-WorkerView *view_of_request(const ServiceRequest *handle)
+// Worker: the state of the job whose current request is handle. g_ctrl.lock must be held.
+JobState *state_of_request(const ServiceRequest *handle)
 {
-    for (auto &entry : g_ctrl.views) {
+    for (auto &entry : g_ctrl.jobs) {
         if (entry.second.handle == handle)
             return &entry.second;
     }
     return nullptr;
 }
 
-// Main loop: copies what the worker wrote for the job into the job.
+// Main loop: the job's state, made from the job when it has none yet. g_ctrl.lock held.
+JobState &state_of(const UploadItem *job_item)
+{
+    auto it = g_ctrl.jobs.find(job_item);
+    if (it != g_ctrl.jobs.end())
+        return it->second;
+    JobState v;
+    v.historyid = job_item->historyid;
+    v.status = job_item->status;
+    v.percent = job_item->percent;
+    v.offset = job_item->offset;
+    v.has_url = job_item->url != nullptr;
+    if (job_item->url)
+        v.url = job_item->url;
+    if (job_item->title)
+        v.title = job_item->title;
+    return g_ctrl.jobs.emplace(job_item, std::move(v)).first->second;
+}
+
+// Main loop: copies the job's state into the job.
 void sync_job(UploadItem *job_item)
 {
     std::string url;
     bool has_url = false;
     {
         std::lock_guard<std::mutex> guard(g_ctrl.lock);
-        auto it = g_ctrl.views.find(job_item);
-        if (it == g_ctrl.views.end())
+        auto it = g_ctrl.jobs.find(job_item);
+        if (it == g_ctrl.jobs.end())
             return;
-        const WorkerView &v = it->second;
-        job_item->status = v.status;
+        const JobState &v = it->second;
+        job_item->status = v.completion_due ? ZV_UPLOAD_STATUS_UPLOADING : v.status;
         job_item->percent = v.percent;
         job_item->offset = v.offset;
         has_url = v.has_url;
@@ -146,39 +182,49 @@ void sync_job(UploadItem *job_item)
     }
 }
 
-// Main loop: the only way the main loop changes a job's status, so that the worker sees it.
-void set_status(UploadItem *job_item, int status)
+// Main loop: the job becomes PAUSED unless it has completed meanwhile (its completion
+// recorded by the worker wins). True when it is PAUSED now.
+bool pause_state(UploadItem *job_item)
 {
-    job_item->status = status;
+    {
+        std::lock_guard<std::mutex> guard(g_ctrl.lock);
+        JobState &v = state_of(job_item);
+        if (v.status == ZV_UPLOAD_STATUS_COMPLETED)
+            return false;
+        v.status = ZV_UPLOAD_STATUS_PAUSED;
+    }
+    job_item->status = ZV_UPLOAD_STATUS_PAUSED;
+    return true;
+}
+
+// Main loop: marks the job's request as queued, before it is: its answer can come before
+// the call that queues it returns.
+void mark_in_flight(UploadItem *job_item, bool in_flight)
+{
     std::lock_guard<std::mutex> guard(g_ctrl.lock);
-    auto it = g_ctrl.views.find(job_item);
-    if (it != g_ctrl.views.end())
-        it->second.status = status;
+    JobState &v = state_of(job_item);
+    if (v.handle == job_item->handle)
+        v.in_flight = in_flight;
 }
 
 // Main loop: gives the job a fresh request and releases the former one; from here on the
-// worker's answers for the former request find no job.
+// worker's answers for the former request find no job, and what they had asked for (a data
+// upload, a completion still to count) is dropped with them. Null when the job completed
+// meanwhile: it keeps its request, and there is nothing left to send.
 ServiceRequest *renew_request(UploadItem *job_item)
 {
     ServiceRequest *former = job_item->handle;
     ServiceRequest *fresh = zv_request_new();
     {
         std::lock_guard<std::mutex> guard(g_ctrl.lock);
-        auto it = g_ctrl.views.find(job_item);
-        if (it == g_ctrl.views.end()) {
-            WorkerView v;
-            v.historyid = job_item->historyid;
-            v.status = job_item->status;
-            v.percent = job_item->percent;
-            v.offset = job_item->offset;
-            v.has_url = job_item->url != nullptr;
-            if (job_item->url)
-                v.url = job_item->url;
-            if (job_item->title)
-                v.title = job_item->title;
-            it = g_ctrl.views.emplace(job_item, std::move(v)).first;
+        JobState &v = state_of(job_item);
+        if (v.status == ZV_UPLOAD_STATUS_COMPLETED) {
+            zv_request_free(fresh);
+            return nullptr;
         }
-        it->second.handle = fresh;
+        v.handle = fresh;
+        v.in_flight = false;
+        v.upload_due = false;
     }
     job_item->handle = fresh;
     if (former)
@@ -186,17 +232,31 @@ ServiceRequest *renew_request(UploadItem *job_item)
     return fresh;
 }
 
-// Main loop: forgets the job's view and releases its request.
+// Main loop: forgets the job's state and releases its request.
 void release_request(UploadItem *job_item)
 {
     {
         std::lock_guard<std::mutex> guard(g_ctrl.lock);
-        g_ctrl.views.erase(job_item);
+        g_ctrl.jobs.erase(job_item);
     }
     if (job_item->handle) {
         zv_request_free(job_item->handle);
         job_item->handle = nullptr;
     }
+}
+
+// Main loop: whether a launch request must leave the job alone, because a request of it is
+// in flight or its answer waits in a pipe. Every such request ends in an answer or a
+// failure that sets the job's next status, so a job left alone is never stuck; starting it
+// again would cancel its transfer or send its metadata a second time.
+bool job_is_busy(const UploadItem *job_item)
+{
+    std::lock_guard<std::mutex> guard(g_ctrl.lock);
+    auto it = g_ctrl.jobs.find(job_item);
+    if (it == g_ctrl.jobs.end())
+        return false;
+    const JobState &v = it->second;
+    return v.in_flight || v.upload_due || v.completion_due;
 }
 
 void cancel_start_idler(UploadItem *job_item)
@@ -219,10 +279,11 @@ void free_job_record(UploadItem *job_item)
     g_free(job_item);
 }
 
-// The job stops where it is: PAUSED, stored, and its badge and the notification follow.
+// The job stops where it is: PAUSED (unless it completed meanwhile), stored, and its badge
+// and the notification follow.
 void pause_job(UploadItem *job_item)
 {
-    set_status(job_item, ZV_UPLOAD_STATUS_PAUSED);
+    pause_state(job_item);
     zv_upload_list_store_item(job_item);
     post_message(PIPE_CHANGE, job_item->historyid);
 }
@@ -230,6 +291,7 @@ void pause_job(UploadItem *job_item)
 // The failure tail of a step of a metadata or data upload (its message already logged).
 void fail_job(UploadItem *job_item)
 {
+    mark_in_flight(job_item, false);
     int ret = zv_request_upload_cancel(job_item->handle);
     if (ret != ZV_ERROR_NONE)
         ZV_LOGE("zv_request_upload_cancel fail: %d", ret);
@@ -261,7 +323,7 @@ bool file_is_sendable(const UploadItem *job_item)
     }
     close(fd);
     if (st.st_size == 0) {
-        ZV_LOGE("file of %d is empty: %s", job_item->historyid, path);
+        ZV_LOGE("file of %d is empty, nothing to upload: %s", job_item->historyid, path);
         return false;
     }
     if (st.st_size > kMaxFileSize) {
@@ -482,6 +544,8 @@ bool zv_upload_ctrl_service(AppData *ad)
     zv_upload_view_destroy(ad);
     zv_upload_list_load_ready_item(ad);
     zv_upload_view_init(ad);
+    // Rows whose store failed earlier get their jobs' real state before anything counts them.
+    zv_upload_list_store_pending(ad);
 
     if (zv_ext_network_check()) {
         int index = 0;
@@ -496,9 +560,7 @@ bool zv_upload_ctrl_service(AppData *ad)
             if (job_item->status != ZV_UPLOAD_STATUS_WAITING &&
                 job_item->status != ZV_UPLOAD_STATUS_UPLOADING)
                 continue;
-            // A job whose request is in flight in this process keeps running; restarting it
-            // would cancel its transfer or send its metadata a second time.
-            if (job_item->handle || g_ctrl.idlers.count(job_item))
+            if (job_is_busy(job_item) || g_ctrl.idlers.count(job_item))
                 continue;
             Ecore_Idler *idler = ecore_idler_add(start_job_cb, job_item);
             if (idler)
@@ -538,6 +600,8 @@ void zv_upload_ctrl_finalize(AppData *ad)
 
     zuvo_ext_noti_ongoing_noti_destroy();
     zuvo_ext_noti_complete_noti_destroy();
+    zv_upload_list_store_pending(ad);
+    zv_upload_list_forget_pending();
     zv_upload_list_reset_full_item(ad);
     zv_ext_media_deinit();
     zv_upload_view_destroy(ad);
@@ -582,17 +646,10 @@ void _zv_upload_ctrl_meta_data_upload(AppData *ad, UploadItem *job_item)
     }
     if (!zv_ext_network_check())
         return;
-    if (!job_item->title) {
-        ZV_LOGE("title of %d is NULL", job_item->historyid);
-        pause_job(job_item);
-        return;
-    }
-    if (!file_is_sendable(job_item)) {
-        pause_job(job_item);
-        return;
-    }
 
     ServiceRequest *handle = renew_request(job_item);
+    if (!handle)
+        return;
     ZV_CTRL_STEP(zv_set_callback_func(handle, _zv_upload_ctrl_resp_cb),
                  "zv_set_callback_func fail: %d");
     ZV_CTRL_STEP(zv_set_user_data(handle, ad), "zv_set_user_data fail: %d");
@@ -601,6 +658,10 @@ void _zv_upload_ctrl_meta_data_upload(AppData *ad, UploadItem *job_item)
     ZV_CTRL_STEP(zv_set_attr_category(handle, ad->category), "zv_set_attr_category fail: %d");
     ZV_CTRL_STEP(zv_set_attr_file_path(handle, job_item->filename),
                  "zv_set_attr_file_path fail: %d");
+    if (!file_is_sendable(job_item)) {
+        fail_job(job_item);
+        return;
+    }
     ZV_CTRL_STEP(zv_set_attr_privacy(handle, ad->access_type), "zv_set_attr_privacy fail: %d");
     if (ad->description)
         ZV_CTRL_STEP(zv_set_attr_description(handle, ad->description),
@@ -613,6 +674,7 @@ void _zv_upload_ctrl_meta_data_upload(AppData *ad, UploadItem *job_item)
         if (zv_ext_location_get_pos(&latitude, &longitude))
             ZV_CTRL_STEP(zv_set_attr_gps(handle, latitude, longitude), "zv_set_attr_gps fail: %d");
     }
+    mark_in_flight(job_item, true);
     ZV_CTRL_STEP(zv_request_meta_upload(handle), "zv_request_meta_upload fail: %d");
 }
 
@@ -627,12 +689,9 @@ void _zv_upload_ctrl_data_upload(AppData *ad, UploadItem *job_item)
         ZV_LOGE("current item is NULL");
         return;
     }
-    if (!file_is_sendable(job_item)) {
-        pause_job(job_item);
-        return;
-    }
-
     ServiceRequest *handle = renew_request(job_item);
+    if (!handle)
+        return;
     ZV_CTRL_STEP(zv_set_callback_func(handle, _zv_upload_ctrl_resp_cb),
                  "zv_set_callback_func fail: %d");
     ZV_CTRL_STEP(zv_set_progress_callback_func(handle, _zv_upload_ctrl_progress_cb),
@@ -643,6 +702,11 @@ void _zv_upload_ctrl_data_upload(AppData *ad, UploadItem *job_item)
                  "zv_set_attr_file_offset fail: %d");
     ZV_CTRL_STEP(zv_set_attr_file_path(handle, job_item->filename),
                  "zv_set_attr_file_path fail: %d");
+    if (!file_is_sendable(job_item)) {
+        fail_job(job_item);
+        return;
+    }
+    mark_in_flight(job_item, true);
     ZV_CTRL_STEP(zv_request_data_upload(handle), "zv_request_data_upload fail: %d");
 }
 
@@ -666,15 +730,28 @@ void _zv_upload_ctrl_resp_cb(int result, ServiceResponse *resp_data, void *user_
 
     PipeKind kind = PIPE_CHANGE;
     int historyid = 0;
+    bool found = false;
     std::string title;
     {
         std::lock_guard<std::mutex> guard(g_ctrl.lock);
-        WorkerView *v = view_of_request(resp_data->handle);
+        JobState *v = state_of_request(resp_data->handle);
         if (!v) {
             kind = PIPE_COUNT;
+        } else {
+            found = true;
+            historyid = v->historyid;
+            v->in_flight = false;
+        }
+        // Each answer moves the job only from the status its request was made in: a job
+        // paused meanwhile stays PAUSED (its data upload is not started), and a COMPLETED
+        // job stays COMPLETED.
+        if (!v) {
         } else if (type == ZV_RESP_TYPE_DATA_UPLOAD) {
-            if (result == ZV_ERROR_NONE) {
+            if (v->status == ZV_UPLOAD_STATUS_COMPLETED) {
+                kind = PIPE_COUNT;
+            } else if (result == ZV_ERROR_NONE) {
                 v->status = ZV_UPLOAD_STATUS_COMPLETED;
+                v->completion_due = true;
                 kind = PIPE_COMPLETE;
             } else {
                 v->status = ZV_UPLOAD_STATUS_PAUSED;
@@ -684,35 +761,41 @@ void _zv_upload_ctrl_resp_cb(int result, ServiceResponse *resp_data, void *user_
             if (result == ZV_ERROR_NONE && resp_data->value) {
                 v->url = resp_data->value;
                 v->has_url = true;
-                v->status = ZV_UPLOAD_STATUS_UPLOADING;
-                kind = PIPE_UPLOAD;
+                if (v->status == ZV_UPLOAD_STATUS_WAITING) {
+                    v->status = ZV_UPLOAD_STATUS_UPLOADING;
+                    v->upload_due = true;
+                    kind = PIPE_UPLOAD;
+                }
             } else {
-                v->status = ZV_UPLOAD_STATUS_PAUSED;
+                if (v->status != ZV_UPLOAD_STATUS_COMPLETED)
+                    v->status = ZV_UPLOAD_STATUS_PAUSED;
                 v->offset = 0;
                 title = v->title;
             }
         } else {
-            if (result == ZV_ERROR_NONE) {
+            if (v->status != ZV_UPLOAD_STATUS_UPLOADING) {
+                // Paused while the query was out: the answer changes nothing.
+            } else if (result == ZV_ERROR_NONE) {
                 v->offset = parse_offset(resp_data->value);
                 v->status = ZV_UPLOAD_STATUS_WAITING;
+                v->upload_due = true;
                 kind = PIPE_UPLOAD;
             } else {
                 v->status = ZV_UPLOAD_STATUS_PAUSED;
             }
         }
-        if (v)
-            historyid = v->historyid;
     }
 
-    if (kind == PIPE_COUNT) {
+    if (!found) {
         ZV_LOGE("Not found item : %p", (void *)resp_data->handle);
         return;
     }
     if (type == ZV_RESP_TYPE_DATA_UPLOAD && result != ZV_ERROR_NONE)
         ZV_LOGI("HTTP RESULT : %ld", (long)resp_data->http_code);
-    if (type == ZV_RESP_TYPE_META_UPLOAD && kind != PIPE_UPLOAD)
+    if (type == ZV_RESP_TYPE_META_UPLOAD && (result != ZV_ERROR_NONE || !resp_data->value))
         ZV_LOGE("META UPLOAD FAIL : %s", title.c_str());
-    post_message(kind, historyid);
+    if (kind != PIPE_COUNT)
+        post_message(kind, historyid);
 }
 
 void _zv_upload_ctrl_progress_cb(ServiceRequest *handle, int percent, void *user_data)
@@ -729,16 +812,20 @@ void _zv_upload_ctrl_progress_cb(ServiceRequest *handle, int percent, void *user
     int historyid = 0;
     {
         std::lock_guard<std::mutex> guard(g_ctrl.lock);
-        WorkerView *v = view_of_request(handle);
+        JobState *v = state_of_request(handle);
         if (!v) {
             kind = PIPE_COUNT;
         } else {
             historyid = v->historyid;
-            v->percent = percent < 0 ? 0 : (percent > 100 ? 100 : percent);
-            if (v->status != ZV_UPLOAD_STATUS_UPLOADING) {
+            if (v->status == ZV_UPLOAD_STATUS_WAITING) {
+                // The first report of a data upload restarted after a status query.
                 v->status = ZV_UPLOAD_STATUS_UPLOADING;
                 kind = PIPE_CHANGE;
+            } else if (v->status != ZV_UPLOAD_STATUS_UPLOADING) {
+                // A paused or completed job: a report still on its way moves nothing.
+                return;
             }
+            v->percent = percent < 0 ? 0 : (percent > 100 ? 100 : percent);
         }
     }
     if (kind == PIPE_COUNT) {
@@ -775,7 +862,31 @@ void _zv_upload_ctrl_pipe_upload_cb(void *data, void *buf, unsigned int nbyte)
     UploadItem *job_item = job_of_message(ad, buf, nbyte, false);
     if (!job_item)
         return;
+    bool due = false;
+    int status = 0;
+    {
+        std::lock_guard<std::mutex> guard(g_ctrl.lock);
+        JobState &v = state_of(job_item);
+        due = v.upload_due;
+        v.upload_due = false;
+        status = v.status;
+    }
+    // One answer starts one data upload: a message whose upload has started already, or
+    // whose request the job no longer holds, would cancel the running upload and send again
+    // from an old offset.
+    if (!due) {
+        ZV_LOGI("no data upload is due for %d", job_item->historyid);
+        return;
+    }
     zv_upload_list_store_item(job_item);
+    if (status != ZV_UPLOAD_STATUS_UPLOADING && status != ZV_UPLOAD_STATUS_WAITING) {
+        // Paused between the answer and this message: the job keeps its address and waits
+        // for the user.
+        ZV_LOGI("%d is no longer uploading (%d), its data upload is not started",
+                job_item->historyid, status);
+        zv_upload_view_update_badge_button(job_item);
+        return;
+    }
     _zv_upload_ctrl_data_upload(ad, job_item);
 }
 
@@ -786,6 +897,9 @@ void _zv_upload_ctrl_pipe_update_progress_cb(void *data, void *buf, unsigned int
     if (!job_item)
         return;
     if (ad->is_paused)
+        return;
+    // A report read after its job paused or completed draws nothing.
+    if (job_item->status != ZV_UPLOAD_STATUS_UPLOADING)
         return;
     if (!job_item->gen_item) {
         ZV_LOGE("%d , item->gen_item is NULL", job_item->historyid);
@@ -821,6 +935,20 @@ void _zv_upload_ctrl_pipe_complete_cb(void *data, void *buf, unsigned int nbyte)
     UploadItem *job_item = job_of_message(ad, buf, nbyte, false);
     if (!job_item)
         return;
+    bool due = false;
+    {
+        std::lock_guard<std::mutex> guard(g_ctrl.lock);
+        JobState &v = state_of(job_item);
+        due = v.completion_due;
+        v.completion_due = false;
+    }
+    if (!due) {
+        ZV_LOGI("completion of %d is counted already", job_item->historyid);
+        return;
+    }
+    // Only now does the main loop see the job COMPLETED: until this count, every other
+    // handler stored and counted it as uploading, so the batch's total stayed whole.
+    sync_job(job_item);
     zv_upload_list_store_item(job_item);
 
     ZV_LOGI("Add current completed item count");
@@ -863,7 +991,13 @@ void _zv_upload_ctrl_pause_upload(AppData *ad, UploadItem *job_item)
         ZV_LOGE("zv_request_upload_pause fail: %d", ret);
         return;
     }
-    pause_job(job_item);
+    // The completion may have been recorded since the status was read: it wins.
+    if (!pause_state(job_item)) {
+        ZV_LOGI("Skip for complete item");
+        return;
+    }
+    zv_upload_list_store_item(job_item);
+    post_message(PIPE_CHANGE, job_item->historyid);
 }
 
 void _zv_upload_ctrl_resume_upload(AppData *ad, UploadItem *job_item)
@@ -883,7 +1017,17 @@ void _zv_upload_ctrl_resume_upload(AppData *ad, UploadItem *job_item)
         return;
     }
 
+    // An empty or missing file has nothing to send: the job stays PAUSED, with no request.
+    if (job_item->status == ZV_UPLOAD_STATUS_PAUSED && !file_is_sendable(job_item)) {
+        post_message(PIPE_CHANGE, job_item->historyid);
+        return;
+    }
+
     ServiceRequest *handle = renew_request(job_item);
+    if (!handle) {
+        ZV_LOGI("Skip for complete item");
+        return;
+    }
     int ret = zv_set_callback_func(handle, _zv_upload_ctrl_resp_cb);
     if (ret != ZV_ERROR_NONE)
         ZV_LOGE("zv_set_callback_func fail: %d", ret);
@@ -898,15 +1042,24 @@ void _zv_upload_ctrl_resume_upload(AppData *ad, UploadItem *job_item)
             ZV_LOGE("zv_set_attr_upload_url fail: %d", ret);
     }
     if (ret == ZV_ERROR_NONE) {
+        // UPLOADING before the query is queued, not after: an answer that comes at once (a
+        // refused connection) then moves the job on from UPLOADING, and nothing here
+        // overwrites it.
+        {
+            std::lock_guard<std::mutex> guard(g_ctrl.lock);
+            JobState &v = state_of(job_item);
+            v.status = ZV_UPLOAD_STATUS_UPLOADING;
+            v.in_flight = true;
+        }
+        job_item->status = ZV_UPLOAD_STATUS_UPLOADING;
         ret = zv_request_upload_query(handle);
         if (ret != ZV_ERROR_NONE)
             ZV_LOGE("zv_request_upload_query fail: %d", ret);
     }
 
-    if (ret == ZV_ERROR_NONE) {
-        set_status(job_item, ZV_UPLOAD_STATUS_UPLOADING);
-    } else {
-        set_status(job_item, ZV_UPLOAD_STATUS_PAUSED);
+    if (ret != ZV_ERROR_NONE) {
+        mark_in_flight(job_item, false);
+        pause_state(job_item);
         int cancel_ret = zv_request_upload_cancel(handle);
         if (cancel_ret != ZV_ERROR_NONE)
             ZV_LOGE("zv_request_upload_cancel fail: %d", cancel_ret);

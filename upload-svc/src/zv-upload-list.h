@@ -42,5 +42,13 @@ void zv_upload_list_load_full_item(AppData *ad);
 void zv_upload_list_load_ready_item(AppData *ad);
 // Shutdown write-back: every WAITING row becomes READY, every UPLOADING row PAUSED.
 void zv_upload_list_reset_full_item(AppData *ad);
-// Stores the job: writes its percent, status and url into its history row.
-void zv_upload_list_store_item(const UploadItem *job_item);
+// Stores the job: writes its percent, status and url into its history row. A store that
+// fails is kept and tried again (at the next store that succeeds, by a timer, and by
+// zv_upload_list_store_pending) until the row holds the job's real state; false when it
+// failed this time.
+bool zv_upload_list_store_item(const UploadItem *job_item);
+// Stores every job whose last store failed, as it is now (jobs gone from ad's list are
+// forgotten). Main loop.
+void zv_upload_list_store_pending(AppData *ad);
+// Drops the jobs waiting for a store and the retry timer (shutdown).
+void zv_upload_list_forget_pending(void);

@@ -452,10 +452,13 @@ int zv_ext_db_update_item(DbItem *item)
     bind_int(s, 4, item->historyid);
 
     int rc = sqlite3_step(s);
-    if (!step_succeeded(rc))
+    const bool stored = step_succeeded(rc);
+    if (!stored)
         ZV_LOGE("SQL return: %d (%s)", rc, sqlite3_errmsg(db));
     finalize(stmt);
-    return 1;
+    // A step that failed (history locked past the busy handler, disk full) is reported, so
+    // that the caller can store the row again later.
+    return stored ? 1 : 0;
 }
 
 int zv_ext_db_load_full_item_list(GList **list)

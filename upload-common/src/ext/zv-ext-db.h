@@ -42,7 +42,8 @@ void zv_ext_db_close(void);
 int zv_ext_db_insert_item(DbItem *item);
 int zv_ext_db_delete_item(int historyid);
 // Writes only percent, status and url (a NULL url clears it) of the rows with the item's
-// historyid. True once the statement was prepared, whatever its step gave.
+// historyid. True when the row was written; false also when the statement ran but failed
+// (history locked past the busy handler, disk full), so that the row can be stored again.
 int zv_ext_db_update_item(DbItem *item);
 // Loads append fresh DbItem records to *list (start from NULL), oldest date first; the
 // caller releases the list with zv_ext_db_free_item_list.

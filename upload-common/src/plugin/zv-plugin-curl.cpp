@@ -818,10 +818,11 @@ int zv_curl_send_request(TransferItem *item)
     CURLMcode mc = g_engine.worker_running ? curl_multi_add_handle(g_engine.multi, item->curl)
                                            : CURLM_BAD_HANDLE;
     if (mc != CURLM_OK) {
-        // Not queued: no answer will come.
+        // Not queued, so no answer will come: the caller is told, so that it does not wait
+        // for one (an engine that failed to start refuses every request this way).
         ZV_LOGE("curl_multi_add_handle Error:: %s", curl_multi_strerror(mc));
         curl_easy_setopt(item->curl, CURLOPT_HTTPHEADER, NULL);
-        return ZV_CURL_ERROR_NONE;
+        return ZV_CURL_ERROR_OPERATION_FAILED;
     }
     item->engine_headers = headers.release();
     item->engine_flags = kAttached;

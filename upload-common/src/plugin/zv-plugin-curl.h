@@ -106,9 +106,10 @@ int zv_curl_init_service(void);
 void zv_curl_finalize_service(void);
 
 // Queues the item's request: 0 when queued (the answer comes through callback_func), 3 for a
-// NULL item, 4 without URL, 5 when libcurl refuses to make a handle. An item that was sent
-// before gets a fresh easy handle; an earlier transfer of it still in the engine is
-// cancelled, and the answer it collected is dropped.
+// NULL item, 4 without URL, 5 when libcurl refuses to make a handle or the engine is not
+// running (no answer will come then). An item that was sent before gets a fresh easy
+// handle; an earlier transfer of it still in the engine is cancelled, and the answer it
+// collected is dropped.
 int zv_curl_send_request(TransferItem *item);
 // Detaches the item's request from the engine: no answer will come for it. 0, 3 (NULL item)
 // or 4 (no URL, or never sent). Returns 0 for a request that has already completed.
