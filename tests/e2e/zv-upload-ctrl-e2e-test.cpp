@@ -39,7 +39,7 @@ class CtrlE2ETest : public zv_e2e::ControllerFixture
 TEST_F(CtrlE2ETest, NetworkEventPausesRunningUploadsAndUploadAgainContinues)
 {
     // The third metadata upload stalls: its job is still waiting at the network event.
-    ASSERT_TRUE(start_server({"kind=data,action=throttle,rate=300000,times=0",
+    ASSERT_TRUE(start_server({"kind=data,action=throttle,rate=100000,times=0",
                               "kind=meta,action=stall,seconds=60,nth=3"}));
     std::string a = video("a.mp4", 3000000, 11);
     std::string b = video("b.mp4", 2500000, 12);
