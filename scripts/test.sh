@@ -19,6 +19,15 @@ zv_install_deps
 werror=OFF
 [ "${CI:-}" = "true" ] && werror=ON
 stages=${ZV_TEST_STAGES:-plain asan tsan fuzz}
+for stage in $stages; do
+  case $stage in
+  plain | asan | tsan | fuzz) ;;
+  *)
+    echo "unknown stage '$stage' in ZV_TEST_STAGES (plain, asan, tsan, fuzz)" >&2
+    exit 2
+    ;;
+  esac
+done
 jobs=$(nproc)
 
 export ZV_REPORT_DIR="$top/build/report"
@@ -35,10 +44,21 @@ run_suite() {
   # The summary and what went wrong; the whole output stays in the log.
   grep -a -E '\*\*\*|tests passed|Failure|ERROR: |WARNING: ThreadSanitizer|runtime error|CMake Error' \
     "$log" || true
-  local summary
+  local summary skipped
   summary=$(grep -a -E '[0-9]+% tests passed' "$log" | tail -n 1) || true
-  printf '%-34s %s (%ss)\n' "$name" "${summary:-no tests ran}" "$((SECONDS - start))" \
-    >>"$ZV_REPORT_DIR/sanitizers.txt"
+  # "100% tests passed, 0 tests failed out of 0" ran nothing.
+  if [[ "$summary" == *"out of 0"* ]]; then
+    summary=""
+  fi
+  skipped=$(grep -a -c -E '\*\*\*Skipped|Not Run' "$log") || true
+  printf '%-34s %s; %s skipped (%ss)\n' "$name" "${summary:-no tests ran}" "${skipped:-0}" \
+    "$((SECONDS - start))" >>"$ZV_REPORT_DIR/sanitizers.txt"
+  # Each skipped test with the reason it gave (from the tests' whole output).
+  if [ -f "$dir/Testing/Temporary/LastTest.log" ]; then
+    awk '/: Skipped$/ { getline reason; next }
+         /^\[  SKIPPED \] [^ ]+ \(/ { printf "  skipped: %s: %s\n", $4, reason; reason = "" }' \
+      "$dir/Testing/Temporary/LastTest.log" >>"$ZV_REPORT_DIR/sanitizers.txt" || true
+  fi
   if [ "$rc" != 0 ] || [ -z "$summary" ]; then
     status=1
   fi
@@ -86,9 +106,9 @@ if [[ " $stages " == *" tsan "* ]]; then
   done
 fi
 
-if [[ " $stages " == *" fuzz "* ]] && [ -x scripts/fuzz.sh ]; then
+if [[ " $stages " == *" fuzz "* ]]; then
   echo "== fuzz targets"
-  if ! scripts/fuzz.sh --seconds "${ZV_FUZZ_SECONDS:-5}" --report "$ZV_REPORT_DIR/fuzz.txt"; then
+  if ! bash scripts/fuzz.sh --seconds "${ZV_FUZZ_SECONDS:-5}" --report "$ZV_REPORT_DIR/fuzz.txt"; then
     status=1
   fi
 fi
@@ -103,10 +123,14 @@ for part in sanitizers stress faults fuzz; do
 done
 # Every build runs the fault scenarios: the total is over all of them.
 if [ -s "$ZV_REPORT_DIR/faults.txt" ]; then
-  sed -n 's/.*: \([0-9]*\) injected, \([0-9]*\) survived$/\1 \2/p' "$ZV_REPORT_DIR/faults.txt" |
+  faults=$(sed -n 's/.*: \([0-9]*\) injected, \([0-9]*\) survived$/\1 \2/p' "$ZV_REPORT_DIR/faults.txt" |
     awk '{ i += $1; s += $2 }
       END { printf "faults in all: %d injected, %d survived; %s\n", i, s,
-            (i == s ? "nothing lost" : "SOME LOST") }'
+            (i == s && i > 0 ? "nothing lost" : "SOME LOST") }')
+  echo "$faults"
+  if [[ "$faults" == *"SOME LOST"* ]]; then
+    status=1
+  fi
 fi
 if [ "$status" = 0 ]; then
   echo "all stages passed"

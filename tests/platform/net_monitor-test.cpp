@@ -62,7 +62,9 @@ const int kSkip = 77;
 int follow_routes_in_own_namespace()
 {
     ecore_fork_reset();
-    if (unshare(CLONE_NEWNET) != 0)
+    // As root a network namespace of its own; otherwise inside a user namespace of its own,
+    // where the machine allows one.
+    if (unshare(CLONE_NEWNET) != 0 && unshare(CLONE_NEWUSER | CLONE_NEWNET) != 0)
         return kSkip;
     unsetenv("http_proxy");
     setenv("ZV_NETWORK", "host", 1);
