@@ -2,6 +2,8 @@
 // endpoints and request log, and the programs of the build that record jobs and set keys.
 #pragma once
 
+#include <Ecore.h>
+
 #include <errno.h>
 
 #include <ctype.h>
@@ -15,6 +17,7 @@
 #include <fstream>
 #include <random>
 #include <sstream>
+#include <map>
 #include <string>
 #include <utility>
 #include <vector>
@@ -25,6 +28,24 @@ namespace zv_e2e
 {
 
 using Env = std::vector<std::pair<std::string, std::string>>;
+
+// The exit statuses of the children that the toolkit's main loop reaped (it reaps every
+// child of the process while it iterates), by pid, so that no exit status is lost.
+inline std::map<pid_t, int> &reaped_by_loop()
+{
+    static std::map<pid_t, int> statuses;
+    static Ecore_Event_Handler *handler = ecore_event_handler_add(
+        ECORE_EXE_EVENT_DEL,
+        [](void *, int, void *event) -> Eina_Bool {
+            auto *del = static_cast<Ecore_Exe_Event_Del *>(event);
+            statuses[del->pid] = del->signalled ? (del->exit_signal & 0x7f)
+                                                : ((del->exit_code & 0xff) << 8);
+            return ECORE_CALLBACK_PASS_ON;
+        },
+        nullptr);
+    (void)handler;
+    return statuses;
+}
 
 // A child process whose standard output and error go to a file; killed at destruction when
 // it still runs.
@@ -45,6 +66,8 @@ class Child
     bool start(const std::vector<std::string> &argv, const std::string &out_path,
                const Env &env = {})
     {
+        reaped_by_loop();
+        killed_ = false;
         pid_ = fork();
         if (pid_ < 0)
             return false;
@@ -79,18 +102,31 @@ class Child
             status_ = status;
             return false;
         }
-        // The toolkit's main loop reaps children too: a child it took is gone all the same.
+        // The toolkit's main loop reaped it: its status comes with the loop's event.
         if (got < 0 && errno == ECHILD) {
+            auto it = reaped_by_loop().find(pid_);
+            if (it == reaped_by_loop().end())
+                return true; // the event is still on its way
             exited_ = true;
+            status_ = it->second;
             return false;
         }
         return true;
     }
     void signal(int sig)
     {
-        if (running())
+        if (running()) {
             kill(pid_, sig);
+            killed_ = killed_ || sig == SIGKILL;
+        }
     }
+    // Exited with status 0, or was killed by this side with SIGKILL.
+    bool ended_well() const
+    {
+        return exited_ && ((WIFEXITED(status_) && WEXITSTATUS(status_) == 0) ||
+                           (killed_ && WIFSIGNALED(status_) && WTERMSIG(status_) == SIGKILL));
+    }
+    int raw_status() const { return status_; }
     // Waits for the exit; true when it exited within timeout_ms. *status: the raw status.
     bool wait_exit(int timeout_ms, int *status = nullptr)
     {
@@ -103,8 +139,21 @@ class Child
   private:
     pid_t pid_ = -1;
     bool exited_ = true;
+    bool killed_ = false;
     int status_ = 0;
 };
+
+// The first sanitizer report in a program's output, or "" when there is none.
+inline std::string sanitizer_report(const std::string &output)
+{
+    for (const char *marker : {"ERROR: AddressSanitizer", "ERROR: LeakSanitizer",
+                               "WARNING: ThreadSanitizer", "runtime error:"}) {
+        size_t at = output.find(marker);
+        if (at != std::string::npos)
+            return output.substr(at, 4000);
+    }
+    return "";
+}
 
 inline size_t collect(char *data, size_t size, size_t n, void *userp)
 {

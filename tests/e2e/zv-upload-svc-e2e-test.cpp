@@ -43,10 +43,13 @@ class ServiceE2ETest : public ::testing::Test
     }
     void TearDown() override
     {
+        // Every service process ends well, and says nothing a sanitizer found.
         for (auto &svc : services_) {
             svc->signal(SIGTERM);
-            svc->wait_exit(kLongWaitMs);
+            EXPECT_TRUE(svc->wait_exit(kLongWaitMs)) << "the service did not end";
+            EXPECT_TRUE(svc->ended_well()) << "exit status " << svc->raw_status();
         }
+        EXPECT_EQ(zv_e2e::sanitizer_report(zv_test::read_file(dir_.file("svc.out"))), "");
         zv_ext_db_close();
     }
 
