@@ -15,8 +15,8 @@
 #include <string>
 #include <vector>
 
-#include "app.h"
 #include "../app/zv-app-test-util.h"
+#include "app.h"
 
 namespace
 {
@@ -103,8 +103,8 @@ class DesktopNotificationTest : public ::testing::Test
         conn_ = eldbus_private_address_connection_get(getenv("DBUS_SESSION_BUS_ADDRESS"));
         if (!conn_)
             return;
-        iface_ = eldbus_service_interface_register(conn_, "/org/freedesktop/Notifications",
-                                                   &kInterface);
+        iface_ =
+            eldbus_service_interface_register(conn_, "/org/freedesktop/Notifications", &kInterface);
         eldbus_name_request(
             conn_, "org.freedesktop.Notifications", ELDBUS_NAME_REQUEST_FLAG_DO_NOT_QUEUE,
             [](void *, const Eldbus_Message *msg, Eldbus_Pending *) {

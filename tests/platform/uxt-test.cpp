@@ -112,7 +112,8 @@ TEST(UxtTables, DarkTableReplacesTheLightOneEverywhere)
 
     // The theme sources name no colour class outside the table (as a part's colour class or
     // as a text style's "cc:").
-    for (const auto &entry : std::filesystem::recursive_directory_iterator(source_path("res/edje"))) {
+    for (const auto &entry :
+         std::filesystem::recursive_directory_iterator(source_path("res/edje"))) {
         if (entry.path().extension() != ".edc")
             continue;
         std::string edc = read_file(entry.path().string());
@@ -156,8 +157,7 @@ TEST(UxtWidgets, ButtonAndScreenReader)
         std::vector<Evas_Object *> found;
         for (Evas_Object *o = evas_object_bottom_get(evas_object_evas_get(win)); o;
              o = evas_object_above_get(o))
-            if (elm_object_widget_check(o) &&
-                !strcmp(elm_object_widget_type_get(o), "Elm_Popup"))
+            if (elm_object_widget_check(o) && !strcmp(elm_object_widget_type_get(o), "Elm_Popup"))
                 found.push_back(o);
         return found;
     };

@@ -742,10 +742,13 @@ TEST_F(ViewTest, TouchTargetsAndTitleSizeAtScale1)
     show_list();
     auto touch_target = [](Evas_Object *obj, const char *what) {
         int w = 0, h = 0;
-        ASSERT_TRUE(wait_for([&] {
-            evas_object_geometry_get(obj, nullptr, nullptr, &w, &h);
-            return w >= 48 && h >= 48;
-        }, 1000)) << what << " is " << w << " x " << h;
+        ASSERT_TRUE(wait_for(
+            [&] {
+                evas_object_geometry_get(obj, nullptr, nullptr, &w, &h);
+                return w >= 48 && h >= 48;
+            },
+            1000))
+            << what << " is " << w << " x " << h;
     };
     touch_target(job->badge, "badge");
     double row_size = font_size(find_text(ad->win, "Row title"));
