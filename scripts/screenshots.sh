@@ -123,4 +123,9 @@ for theme in light dark; do
     session "empty-$theme" $theme 1 one "$out/placeholder$suffix" none
 done
 session list-2x light 2 one "$out/list-2x" jobs
+# The title bars follow the tables.
+python3 scripts/screenshots.py title-colour "$out/list.png" \
+    res/tables/zuvo-upload-svc_ChangeableColorInfo.xml
+python3 scripts/screenshots.py title-colour "$out/list-dark.png" \
+    res/tables/dark/zuvo-upload-svc_ChangeableColorInfo.xml
 ls -1 "$out"

@@ -78,8 +78,8 @@ TEST(UxtTables, ApplicationTablesLoadWithTheListColours)
 }
 
 // ZV_THEME=dark loads the dark table in place of the light one: it has every code of the
-// light table, with dark surfaces and light texts; and every colour class the themes use is
-// one of those codes, so that the whole window follows the table.
+// light table, with dark surfaces and light texts; and every colour and text class the
+// themes use is one of the tables', so that the whole window follows them.
 TEST(UxtTables, DarkTableReplacesTheLightOneEverywhere)
 {
     const std::string light_path = table_path("zuvo-upload-svc_ChangeableColorInfo.xml");
@@ -110,18 +110,24 @@ TEST(UxtTables, DarkTableReplacesTheLightOneEverywhere)
     for (const char *text_code : {"AO010", "AO011"})
         EXPECT_GT(luma(dark, text_code), luma(light, text_code) + 100) << text_code;
 
-    // The theme sources name no colour class outside the table (as a part's colour class or
-    // as a text style's "cc:").
+    // The theme sources name no colour class outside the colour table (as a part's colour
+    // class or as a text style's "cc:") and no text class outside the font table.
+    std::set<std::string> fonts;
+    text = read_file(table_path("zuvo-upload-svc_ChangeableFontInfo.xml"));
+    for (size_t at = text.find("class=\""); at != std::string::npos;
+         at = text.find("class=\"", at + 1))
+        fonts.insert(text.substr(at + 7, 4));
     for (const auto &entry :
          std::filesystem::recursive_directory_iterator(source_path("res/edje"))) {
         if (entry.path().extension() != ".edc")
             continue;
         std::string edc = read_file(entry.path().string());
-        for (const char *mark : {"color_class: \"", "cc:"}) {
+        for (const char *mark : {"color_class: \"", "cc:", "text_class: \"", "text_class="}) {
+            const std::set<std::string> &known = mark[0] == 't' ? fonts : codes;
             for (size_t at = edc.find(mark); at != std::string::npos; at = edc.find(mark, at + 1)) {
                 size_t from = at + strlen(mark);
                 std::string name = edc.substr(from, edc.find_first_of("\" ", from) - from);
-                EXPECT_TRUE(codes.count(name)) << entry.path() << " uses the colour class " << name;
+                EXPECT_TRUE(known.count(name)) << entry.path() << " uses the class " << name;
             }
         }
     }
