@@ -3,7 +3,9 @@
 // notifications/status-messages.log. Posted notifications are also shown on the desktop's
 // notification service (org.freedesktop.Notifications, through Eldbus) when the session bus
 // has one; its ids are kept in notifications/desktop/TAG so that another process can replace
-// or close what this one showed.
+// or close what this one showed. A notification with a launch application carries the
+// desktop's default action: invoking it (a click) sends that application a launch request,
+// as a tap in the phone's tray does.
 #include "notification.h"
 #include "zv-platform-util.h"
 
@@ -22,6 +24,7 @@
 #include <memory>
 #include <optional>
 #include <string>
+#include <thread>
 
 #include "zv-log.h"
 
@@ -32,6 +35,7 @@ const char kGroup[] = "notification";
 const char kStatusLog[] = "status-messages.log";
 const char kBusName[] = "org.freedesktop.Notifications";
 const char kBusPath[] = "/org/freedesktop/Notifications";
+const char kDefaultAction[] = "default";
 
 struct GFreeDeleter {
     void operator()(void *p) const { g_free(p); }
@@ -274,7 +278,46 @@ class DesktopNotifier
         }
         Eldbus_Object *obj = eldbus_object_get(conn_, kBusName, kBusPath);
         proxy_ = obj ? eldbus_proxy_get(obj, kBusName) : nullptr;
+        if (proxy_)
+            eldbus_proxy_signal_handler_add(proxy_, "ActionInvoked", on_action_invoked, this);
         return proxy_ != nullptr;
+    }
+
+    // A tap opens the notification's application, unless the notification says otherwise.
+    static bool launches(const _notification &n)
+    {
+        return n.launch_app_id && !(n.property & NOTIFICATION_PROP_DISABLE_APP_LAUNCH);
+    }
+
+    // The desktop's click on one of our notifications: its application gets a launch request.
+    // The request waits for the running instance to take it, and that instance may be this
+    // very process; so it is sent from a thread of its own while this main loop goes on.
+    static void on_action_invoked(void *data, const Eldbus_Message *msg)
+    {
+        auto *self = static_cast<DesktopNotifier *>(data);
+        uint32_t id = 0;
+        const char *action = nullptr;
+        if (!eldbus_message_arguments_get(msg, "us", &id, &action) || !action ||
+            strcmp(action, kDefaultAction) != 0)
+            return;
+        for (const auto &kv : self->entries_) {
+            const Entry &e = kv.second;
+            if (e.id != id || e.closed || !launches(e.latest))
+                continue;
+            ZV_LOGI("notification %s clicked: launching %s", kv.first.c_str(),
+                    e.latest.launch_app_id->c_str());
+            app_control_h request = nullptr;
+            if (app_control_create(&request) != APP_CONTROL_ERROR_NONE)
+                return;
+            app_control_set_app_id(request, e.latest.launch_app_id->c_str());
+            std::thread([request] {
+                int rc = app_control_send_launch_request(request, nullptr, nullptr);
+                if (rc != APP_CONTROL_ERROR_NONE)
+                    ZV_LOGE("launch from the notification failed: %d", rc);
+                app_control_destroy(request);
+            }).detach();
+            return;
+        }
     }
 
     // False when the address names a socket file that is not there (a bus that has gone):
@@ -327,6 +370,10 @@ class DesktopNotifier
         eldbus_message_iter_arguments_append(iter, "susss", "zuvo-upload-svc", e.id, "",
                                              n.title.c_str(), body.c_str());
         Eldbus_Message_Iter *actions = eldbus_message_iter_container_new(iter, 'a', "s");
+        if (launches(n)) {
+            eldbus_message_iter_basic_append(actions, 's', kDefaultAction);
+            eldbus_message_iter_basic_append(actions, 's', "Open");
+        }
         eldbus_message_iter_container_close(iter, actions);
         Eldbus_Message_Iter *hints = eldbus_message_iter_container_new(iter, 'a', "{sv}");
         if (n.progress)

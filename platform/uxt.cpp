@@ -2,6 +2,12 @@
 // files and pushed to Edje as colour and text classes, colour codes applied to objects, the
 // application's button factory and the screen-reader switch (Elementary's access mode).
 //
+// Theme: with ZV_THEME=dark a colour table is read from the dark/ folder beside the file
+// asked for (tables/dark/NAME for tables/NAME), when there is one.
+// Screen reader: the settings key db/setting/accessibility/tts (int, 1 on) is the host's
+// screen reader; switching it off for the application clears the key, and the notice that
+// says so is shown only when the key was on.
+//
 // Table files:
 //   <ChangeableColorTable> <Color code="AO005" r="0" g="122" b="255" a="255"/> ...
 //   <ChangeableFontTable>  <Font class="T01" family="Sans" style="Regular" size="28"/> ...
@@ -14,11 +20,14 @@
 #include <libxml/tree.h>
 #include <stdlib.h>
 #include <string.h>
+#include <unistd.h>
 
 #include <map>
 #include <memory>
 #include <string>
 
+#include "app_i18n.h"
+#include "vconf.h"
 #include "zv-log.h"
 
 struct uxt_theme_color_table_s {
@@ -44,7 +53,12 @@ struct UxtState {
     uxt_theme_color_table_h color_table = nullptr;
     uxt_theme_font_table_h font_table = nullptr;
     bool screen_reader = false;
+    // The host's screen reader was on when the application switched it off, and the popup
+    // that says so has not been shown yet.
+    bool reader_notice_due = false;
 };
+
+constexpr const char kScreenReaderKey[] = "db/setting/accessibility/tts";
 
 UxtState &uxt_state()
 {
@@ -137,8 +151,33 @@ int uxt_theme_set_changeable_ui_enabled(bool enabled)
     return UXT_ERROR_NONE;
 }
 
+namespace {
+
+// The dark table of file_path (its folder's dark/ with the same name) when ZV_THEME=dark and
+// it exists; else file_path itself.
+std::string themed_path(const char *file_path)
+{
+    const char *theme = getenv("ZV_THEME");
+    if (!theme || strcmp(theme, "dark") != 0)
+        return file_path;
+    std::string path(file_path);
+    size_t slash = path.rfind('/');
+    std::string dark = slash == std::string::npos
+                           ? "dark/" + path
+                           : path.substr(0, slash + 1) + "dark" + path.substr(slash);
+    if (access(dark.c_str(), R_OK) != 0) {
+        ZV_LOGW("ZV_THEME=dark but no %s: the light colour table stays", dark.c_str());
+        return file_path;
+    }
+    return dark;
+}
+
+} // namespace
+
 uxt_theme_color_table_h uxt_theme_add_color_table(const char *file_path)
 {
+    std::string themed = file_path ? themed_path(file_path) : std::string();
+    file_path = file_path ? themed.c_str() : nullptr;
     xmlNode *root = nullptr;
     XmlDocPtr doc = load_table(file_path, "ChangeableColorTable", &root);
     if (!doc)
@@ -290,19 +329,59 @@ int uxt_access_set_screen_reader_enabled(Evas_Object *win, bool enabled)
     if (!win)
         return UXT_ERROR_INVALID_PARAMETER;
     UxtState &st = uxt_state();
+    int host_reader = 0;
+    if (vconf_get_int(kScreenReaderKey, &host_reader) != 0)
+        host_reader = 0;
+    if (!enabled && host_reader != 0) {
+        st.reader_notice_due = true;
+        if (vconf_set_int(kScreenReaderKey, 0) != 0)
+            ZV_LOGE("cannot clear %s", kScreenReaderKey);
+    } else if (enabled && host_reader == 0 && vconf_set_int(kScreenReaderKey, 1) != 0) {
+        ZV_LOGE("cannot set %s", kScreenReaderKey);
+    }
     st.screen_reader = enabled;
     elm_config_access_set(enabled ? EINA_TRUE : EINA_FALSE);
-    ZV_LOGI("screen reader %s", enabled ? "on" : "off");
+    ZV_LOGI("screen reader %s (the host's was %s)", enabled ? "on" : "off",
+            host_reader ? "on" : "off");
     return UXT_ERROR_NONE;
 }
+
+namespace {
+
+void reader_popup_close_cb(void *data, Evas_Object *, void *)
+{
+    evas_object_del(static_cast<Evas_Object *>(data));
+}
+
+} // namespace
 
 int uxt_access_show_screen_reader_disabled_popup(Evas_Object *win)
 {
     if (!win)
         return UXT_ERROR_INVALID_PARAMETER;
-    // A desktop has no platform screen reader that the user could miss; the notice would only
-    // cover the list at every launch, so it is not shown here.
-    ZV_LOGI("screen reader notice not shown (screen reader %s)",
-            uxt_state().screen_reader ? "on" : "off");
+    UxtState &st = uxt_state();
+    // Only a screen reader that was really on is worth a notice; otherwise it would cover the
+    // list at every launch.
+    if (!st.reader_notice_due || st.screen_reader) {
+        ZV_LOGI("screen reader notice not needed");
+        return UXT_ERROR_NONE;
+    }
+    st.reader_notice_due = false;
+    Evas_Object *popup = elm_popup_add(win);
+    if (!popup)
+        return UXT_ERROR_INVALID_PARAMETER;
+    elm_popup_align_set(popup, ELM_NOTIFY_ALIGN_FILL, 1.0);
+    elm_object_style_set(popup, "default");
+    evas_object_size_hint_weight_set(popup, EVAS_HINT_EXPAND, EVAS_HINT_EXPAND);
+    elm_object_part_text_set(popup, "title,text", i18n_get_text("IDS_ST_HEADER_SCREEN_READER"));
+    elm_object_text_set(popup, i18n_get_text("IDS_ST_POP_SCREEN_READER_TURNED_OFF"));
+    Evas_Object *ok = elm_button_add(popup);
+    elm_object_style_set(ok, "popup");
+    elm_object_text_set(ok, i18n_get_text("IDS_COM_SK_OK"));
+    evas_object_smart_callback_add(ok, "clicked", reader_popup_close_cb, popup);
+    elm_object_part_content_set(popup, "button1", ok);
+    evas_object_smart_callback_add(popup, "block,clicked", reader_popup_close_cb, popup);
+    evas_object_show(popup);
+    ZV_LOGI("screen reader notice shown");
     return UXT_ERROR_NONE;
 }

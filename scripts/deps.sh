@@ -5,7 +5,7 @@ ZV_DEB_PACKAGES=(
   libcurl4-openssl-dev libxml2-dev libsqlite3-dev libglib2.0-dev
   libgtest-dev libgmock-dev
   libmicrohttpd-dev libssl-dev openssl
-  gettext curl xvfb xauth matchbox-window-manager clang libclang-rt-14-dev
+  gettext curl xvfb xauth matchbox-window-manager xdotool clang libclang-rt-14-dev
   gstreamer1.0-tools gstreamer1.0-plugins-base gstreamer1.0-plugins-good
   dbus-daemon iproute2
 )

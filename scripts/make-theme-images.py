@@ -111,6 +111,29 @@ def thumb_placeholder(x, y):
     return (s1 <= 0 and s2 <= 0 and s3 <= 0) or (s1 >= 0 and s2 >= 0 and s3 >= 0)
 
 
+def rounded_square(x, y, half, radius):
+    """Inside a square of half-size half around the middle, with corners of that radius."""
+    dx = max(abs(x - 0.5) - (half - radius), 0.0)
+    dy = max(abs(y - 0.5) - (half - radius), 0.0)
+    return math.hypot(dx, dy) <= radius
+
+
+def check_box(x, y):
+    """The filled box of a check box that is on."""
+    return rounded_square(x, y, 0.46, 0.12)
+
+
+def check_outline(x, y):
+    """The frame of a check box that is off."""
+    return rounded_square(x, y, 0.46, 0.12) and not rounded_square(x, y, 0.36, 0.04)
+
+
+def check_mark(x, y):
+    """The tick drawn over the filled box."""
+    return min(seg_dist(x, y, 0.25, 0.52, 0.42, 0.69),
+               seg_dist(x, y, 0.42, 0.69, 0.76, 0.33)) <= 0.065
+
+
 def main():
     os.makedirs(OUT, exist_ok=True)
     pictures = (
@@ -118,6 +141,9 @@ def main():
         ("zuvo_icon_badge_upload.png", 96, 96, upload_badge),
         ("zv_nocontents_uploads.png", 240, 192, no_uploads),
         ("zv_thumb_placeholder.png", 96, 96, thumb_placeholder),
+        ("zv_check_box.png", 96, 96, check_box),
+        ("zv_check_outline.png", 96, 96, check_outline),
+        ("zv_check_mark.png", 96, 96, check_mark),
     )
     for name, w, h, shape in pictures:
         write_png(os.path.join(OUT, name), w, h, render(w, h, shape))

@@ -6,9 +6,12 @@
                                           (waiting, uploading, paused, completed) and
                                           thumbnails; uses the ZV_* environment
   screenshots.py xwd2png XWD PNG          converts an X window dump (Xvfb -fbdir) to PNG
+  screenshots.py title-colour PNG TABLE   checks that the title bar of the picture has the
+                                          colour table's AO002
 """
 import math
 import os
+import re
 import sqlite3
 import struct
 import subprocess
@@ -104,11 +107,58 @@ def xwd2png(xwd_path, png_path):
         f.write(png_bytes(width, height, rows))
 
 
+def png_pixel(path, x, y):
+    """The RGB of one pixel of an 8-bit RGB or RGBA PNG (as png_bytes and Evas write them)."""
+    data = open(path, "rb").read()
+    pos, idat, width, channels = 8, b"", 0, 3
+    while pos < len(data):
+        (length,) = struct.unpack(">I", data[pos:pos + 4])
+        kind, body = data[pos + 4:pos + 8], data[pos + 8:pos + 8 + length]
+        if kind == b"IHDR":
+            width, color_type = struct.unpack(">I", body[:4])[0], body[9]
+            channels = 4 if color_type == 6 else 3
+        elif kind == b"IDAT":
+            idat += body
+        pos += 12 + length
+    raw = zlib.decompress(idat)
+    stride = width * channels + 1
+    prev = bytearray(width * channels)
+    for row in range(y + 1):
+        kind, line = raw[row * stride], bytearray(raw[row * stride + 1:(row + 1) * stride])
+        for i in range(len(line)):
+            a = line[i - channels] if i >= channels else 0
+            b = prev[i]
+            c = prev[i - channels] if i >= channels else 0
+            if kind == 1:
+                line[i] = (line[i] + a) & 0xFF
+            elif kind == 2:
+                line[i] = (line[i] + b) & 0xFF
+            elif kind == 3:
+                line[i] = (line[i] + (a + b) // 2) & 0xFF
+            elif kind == 4:
+                p = a + b - c
+                pa, pb, pc = abs(p - a), abs(p - b), abs(p - c)
+                line[i] = (line[i] + (a if pa <= pb and pa <= pc else b if pb <= pc else c)) & 0xFF
+        prev = line
+    return tuple(prev[x * channels:x * channels + 3])
+
+
+def title_colour(png, table):
+    match = re.search(r'code="AO002" r="(\d+)" g="(\d+)" b="(\d+)"', open(table).read())
+    want = tuple(int(v) for v in match.groups())
+    got = png_pixel(png, 4, 4)
+    if got != want:
+        sys.exit("%s: title bar %s, but AO002 of %s is %s" % (png, got, table, want))
+    print("%s: title bar AO002 %s" % (png, got))
+
+
 def main():
     if len(sys.argv) == 4 and sys.argv[1] == "prepare":
         prepare(sys.argv[2], sys.argv[3])
     elif len(sys.argv) == 4 and sys.argv[1] == "xwd2png":
         xwd2png(sys.argv[2], sys.argv[3])
+    elif len(sys.argv) == 4 and sys.argv[1] == "title-colour":
+        title_colour(sys.argv[2], sys.argv[3])
     else:
         sys.stderr.write(__doc__)
         sys.exit(2)

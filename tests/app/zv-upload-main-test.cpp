@@ -223,6 +223,7 @@ TEST_F(UploadMainAppTest, CreateBuildsTheWindowStackAndTerminateTakesItDown)
     EXPECT_EQ(elm_object_content_get(ad.conform), ad.layout);
     EXPECT_EQ(elm_object_part_content_get(ad.layout, "elm.swallow.content"), ad.navi);
     EXPECT_NE(ad.bg, nullptr);
+    EXPECT_EQ(elm_object_part_content_get(ad.layout, "elm.swallow.bg"), ad.bg);
     EXPECT_NE(ad.color_table, nullptr);
     EXPECT_NE(ad.font_table, nullptr);
     EXPECT_NE(ad.exit, nullptr); // the controller started
@@ -234,13 +235,16 @@ TEST_F(UploadMainAppTest, CreateBuildsTheWindowStackAndTerminateTakesItDown)
 
     // Two launch requests leave one pair of key handlers: a key event reaches the view once,
     // and with the current pair gone it reaches the view no more.
+    // The window, iconified meanwhile, comes back with a launch request.
     const Extras extras = {{"ZV_DATA_ACCESS_TOKEN", "t"}, {"ZV_DATA_CATEGORY", "Music"},
                            {"ZV_DATA_ACCESS_TYPE", "1"}};
+    elm_win_iconified_set(ad.win, EINA_TRUE);
     for (int i = 0; i < 2; i++) {
         app_control_h h = make_request(extras);
         _app_control(h, &ad);
         app_control_destroy(h);
     }
+    EXPECT_FALSE(elm_win_iconified_get(ad.win));
     ASSERT_NE(ad.key_down_handler, nullptr);
     auto press = [] {
         auto *ev = static_cast<Ecore_Event_Key *>(calloc(1, sizeof(Ecore_Event_Key)));

@@ -1,5 +1,6 @@
 // Tests of the host notification service against a desktop notification service: a private
-// session bus (dbus-daemon) with a stand-in org.freedesktop.Notifications in this process.
+// session bus (tests/CMakeLists.txt runs these under dbus-run-session) with a stand-in
+// org.freedesktop.Notifications in this process that records the calls and clicks.
 #include "notification.h"
 
 #include <Eldbus.h>
@@ -10,10 +11,12 @@
 #include <sys/wait.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <string>
 #include <vector>
 
-#include "zv-test-util.h"
+#include "../app/zv-app-test-util.h"
+#include "app.h"
 
 namespace
 {
@@ -24,6 +27,8 @@ struct NotifyCall {
     uint32_t replaces_id;
     std::string summary;
     std::string body;
+    std::string actions; // "key,label,..."
+    int value;           // the progress hint, -1 without one
 };
 
 struct DesktopService {
@@ -44,7 +49,18 @@ Eldbus_Message *on_notify(const Eldbus_Service_Interface *, const Eldbus_Message
     if (!eldbus_message_arguments_get(msg, "susssasa{sv}i", &app, &replaces, &icon, &summary, &body,
                                       &actions, &hints, &timeout))
         return eldbus_message_error_new(msg, "org.freedesktop.DBus.Error.InvalidArgs", "args");
-    g_service.notifies.push_back({replaces, summary, body});
+    NotifyCall call{replaces, summary, body, "", -1};
+    const char *text = nullptr;
+    while (eldbus_message_iter_get_and_next(actions, 's', &text))
+        call.actions += (call.actions.empty() ? "" : ",") + std::string(text);
+    Eldbus_Message_Iter *entry = nullptr, *variant = nullptr;
+    while (eldbus_message_iter_get_and_next(hints, 'e', &entry)) {
+        const char *key = nullptr;
+        if (eldbus_message_iter_arguments_get(entry, "sv", &key, &variant) &&
+            !strcmp(key, "value") && !eldbus_message_iter_arguments_get(variant, "i", &call.value))
+            call.value = -2;
+    }
+    g_service.notifies.push_back(call);
     Eldbus_Message *reply = eldbus_message_method_return_new(msg);
     eldbus_message_arguments_append(reply, "u", replaces ? replaces : g_service.next_id++);
     return reply;
@@ -67,8 +83,13 @@ const Eldbus_Method kMethods[] = {
     {nullptr, nullptr, nullptr, nullptr, 0},
 };
 
+const Eldbus_Signal kSignals[] = {
+    {"ActionInvoked", ELDBUS_ARGS({"u", "id"}, {"s", "action_key"}), 0},
+    {nullptr, nullptr, 0},
+};
+
 const Eldbus_Service_Interface_Desc kInterface = {
-    "org.freedesktop.Notifications", kMethods, nullptr, nullptr, nullptr, nullptr};
+    "org.freedesktop.Notifications", kMethods, kSignals, nullptr, nullptr, nullptr};
 
 class DesktopNotificationTest : public ::testing::Test
 {
@@ -76,26 +97,14 @@ class DesktopNotificationTest : public ::testing::Test
     static void SetUpTestSuite()
     {
         dir_ = new zv_test::TempDir();
-        gchar *daemon = g_find_program_in_path("dbus-daemon");
-        if (!daemon)
+        if (!getenv("ZV_PRIVATE_BUS") || !getenv("DBUS_SESSION_BUS_ADDRESS"))
             return;
-        std::string socket = dir_->file("bus");
-        std::string address = "unix:path=" + socket;
-        daemon_pid_ = fork();
-        if (daemon_pid_ == 0) {
-            execl(daemon, daemon, "--session", "--nofork", "--nopidfile",
-                  ("--address=" + address).c_str(), (char *)nullptr);
-            _exit(127);
-        }
-        g_free(daemon);
-        if (daemon_pid_ < 0 || !wait_for([&] { return access(socket.c_str(), F_OK) == 0; }, 10000))
-            return;
-        setenv("DBUS_SESSION_BUS_ADDRESS", address.c_str(), 1);
         eldbus_init();
-        conn_ = eldbus_private_address_connection_get(address.c_str());
+        conn_ = eldbus_private_address_connection_get(getenv("DBUS_SESSION_BUS_ADDRESS"));
         if (!conn_)
             return;
-        eldbus_service_interface_register(conn_, "/org/freedesktop/Notifications", &kInterface);
+        iface_ =
+            eldbus_service_interface_register(conn_, "/org/freedesktop/Notifications", &kInterface);
         eldbus_name_request(
             conn_, "org.freedesktop.Notifications", ELDBUS_NAME_REQUEST_FLAG_DO_NOT_QUEUE,
             [](void *, const Eldbus_Message *msg, Eldbus_Pending *) {
@@ -112,28 +121,26 @@ class DesktopNotificationTest : public ::testing::Test
     {
         if (conn_)
             eldbus_connection_unref(conn_);
-        if (daemon_pid_ > 0) {
-            kill(daemon_pid_, SIGTERM);
-            waitpid(daemon_pid_, nullptr, 0);
-        }
-        unsetenv("DBUS_SESSION_BUS_ADDRESS");
         delete dir_;
     }
 
     void SetUp() override
     {
         if (!g_service.owned)
-            GTEST_SKIP() << "no private session bus (dbus-daemon) here";
+            GTEST_SKIP() << "runs on a private session bus (dbus-run-session)";
     }
 
+    // The desktop's click on a notification.
+    static void click(uint32_t id) { eldbus_service_signal_emit(iface_, 0, id, "default"); }
+
     static zv_test::TempDir *dir_;
-    static pid_t daemon_pid_;
     static Eldbus_Connection *conn_;
+    static Eldbus_Service_Interface *iface_;
 };
 
 zv_test::TempDir *DesktopNotificationTest::dir_ = nullptr;
-pid_t DesktopNotificationTest::daemon_pid_ = -1;
 Eldbus_Connection *DesktopNotificationTest::conn_ = nullptr;
+Eldbus_Service_Interface *DesktopNotificationTest::iface_ = nullptr;
 
 TEST_F(DesktopNotificationTest, PostedNotificationIsShownReplacedAndClosed)
 {
@@ -167,6 +174,58 @@ TEST_F(DesktopNotificationTest, PostedNotificationIsShownReplacedAndClosed)
     EXPECT_EQ(g_service.closed.back(), id);
     EXPECT_NE(access(dir_->file("run/notifications/desktop/desktop_test").c_str(), F_OK), 0);
     notification_free(noti);
+}
+
+// The ongoing notification carries the default action and its progress as the "value" hint;
+// a click on it sends its application, here running, a launch request. A notification that
+// launches nothing (the completion one) has no action.
+TEST_F(DesktopNotificationTest, ClickLaunchesTheApplication)
+{
+    std::string probe_log = dir_->file("probe.log");
+    setenv("ZV_PROBE_LOG", probe_log.c_str(), 1);
+    pid_t app = zv_test::spawn_program({zv_test::bin_path("zv-app-probe")});
+    ASSERT_TRUE(wait_for([&] { return zv_test::has_line(probe_log, "app_control"); }, 20000));
+
+    notification_h ongoing = notification_create(NOTIFICATION_TYPE_ONGOING);
+    app_control_h launch = nullptr;
+    app_control_create(&launch);
+    app_control_set_app_id(launch, "zuvo-upload-svc");
+    notification_set_launch_option(ongoing, NOTIFICATION_LAUNCH_OPTION_APP_CONTROL, launch);
+    app_control_destroy(launch);
+    notification_set_progress(ongoing, 0.37);
+    notification_set_tag(ongoing, "click_ongoing");
+    notification_h done = notification_create(NOTIFICATION_TYPE_NOTI);
+    notification_set_property(done, NOTIFICATION_PROP_DISABLE_APP_LAUNCH);
+    notification_set_tag(done, "click_complete");
+    g_service.notifies.clear();
+    ASSERT_EQ(notification_post(ongoing), NOTIFICATION_ERROR_NONE);
+    ASSERT_EQ(notification_post(done), NOTIFICATION_ERROR_NONE);
+    ASSERT_TRUE(wait_for([] { return g_service.notifies.size() == 2; }));
+    EXPECT_EQ(g_service.notifies[0].actions, "default,Open");
+    EXPECT_EQ(g_service.notifies[0].value, 37);
+    EXPECT_EQ(g_service.notifies[1].actions, "");
+    // The ids the service gave, as the notifier keeps them.
+    auto id = [](const char *tag) {
+        std::string file = dir_->file(std::string("run/notifications/desktop/") + tag);
+        EXPECT_TRUE(wait_for([&] { return access(file.c_str(), F_OK) == 0; }));
+        return (uint32_t)g_ascii_strtoull(zv_test::read_file(file).c_str(), nullptr, 10);
+    };
+    auto launches = [&] {
+        auto lines = zv_test::read_lines(probe_log);
+        return std::count(lines.begin(), lines.end(), "app_control");
+    };
+    click(id("click_complete"));
+    click(id("click_ongoing"));
+    EXPECT_TRUE(wait_for([&] { return launches() == 2; }, 10000));
+    EXPECT_FALSE(wait_for([&] { return launches() > 2; }, 500));
+
+    notification_delete(ongoing);
+    notification_delete(done);
+    notification_free(ongoing);
+    notification_free(done);
+    kill(app, SIGTERM);
+    EXPECT_EQ(zv_test::wait_program(app), 0);
+    unsetenv("ZV_PROBE_LOG");
 }
 
 } // namespace

@@ -6,8 +6,13 @@
 #include <Elementary.h>
 #include <gtest/gtest.h>
 
+#include <filesystem>
+#include <set>
 #include <string>
+#include <vector>
 
+#include "app_i18n.h"
+#include "vconf.h"
 #include "zv-test-util.h"
 
 using namespace zv_test;
@@ -72,6 +77,64 @@ TEST(UxtTables, ApplicationTablesLoadWithTheListColours)
     EXPECT_EQ(uxt_theme_get_color("AO005", &r, &g, &b, &a), UXT_ERROR_NO_DATA);
 }
 
+// ZV_THEME=dark loads the dark table in place of the light one: it has every code of the
+// light table, with dark surfaces and light texts; and every colour and text class the
+// themes use is one of the tables', so that the whole window follows them.
+TEST(UxtTables, DarkTableReplacesTheLightOneEverywhere)
+{
+    const std::string light_path = table_path("zuvo-upload-svc_ChangeableColorInfo.xml");
+    uxt_theme_color_table_h light = uxt_theme_add_color_table(light_path.c_str());
+    setenv("ZV_THEME", "dark", 1);
+    uxt_theme_color_table_h dark = uxt_theme_add_color_table(light_path.c_str());
+    unsetenv("ZV_THEME");
+    ASSERT_NE(light, nullptr);
+    ASSERT_NE(dark, nullptr);
+
+    auto luma = [](uxt_theme_color_table_h table, const std::string &code) {
+        uxt_theme_set_color_table(table);
+        int r = 0, g = 0, b = 0, a = 0;
+        if (uxt_theme_get_color(code.c_str(), &r, &g, &b, &a) != UXT_ERROR_NONE)
+            return -1;
+        return (r * 299 + g * 587 + b * 114) / 1000;
+    };
+    std::set<std::string> codes;
+    std::string text = read_file(light_path);
+    for (size_t at = text.find("code=\""); at != std::string::npos;
+         at = text.find("code=\"", at + 1))
+        codes.insert(text.substr(at + 6, 5));
+    ASSERT_GE(codes.size(), 20u);
+    for (const auto &code : codes)
+        EXPECT_GE(luma(dark, code), 0) << code << " missing from the dark table";
+    for (const char *surface : {"AO001", "AO002", "AO018"})
+        EXPECT_LT(luma(dark, surface), luma(light, surface) - 100) << surface;
+    for (const char *text_code : {"AO010", "AO011"})
+        EXPECT_GT(luma(dark, text_code), luma(light, text_code) + 100) << text_code;
+
+    // The theme sources name no colour class outside the colour table (as a part's colour
+    // class or as a text style's "cc:") and no text class outside the font table.
+    std::set<std::string> fonts;
+    text = read_file(table_path("zuvo-upload-svc_ChangeableFontInfo.xml"));
+    for (size_t at = text.find("class=\""); at != std::string::npos;
+         at = text.find("class=\"", at + 1))
+        fonts.insert(text.substr(at + 7, 4));
+    for (const auto &entry :
+         std::filesystem::recursive_directory_iterator(source_path("res/edje"))) {
+        if (entry.path().extension() != ".edc")
+            continue;
+        std::string edc = read_file(entry.path().string());
+        for (const char *mark : {"color_class: \"", "cc:", "text_class: \"", "text_class="}) {
+            const std::set<std::string> &known = mark[0] == 't' ? fonts : codes;
+            for (size_t at = edc.find(mark); at != std::string::npos; at = edc.find(mark, at + 1)) {
+                size_t from = at + strlen(mark);
+                std::string name = edc.substr(from, edc.find_first_of("\" ", from) - from);
+                EXPECT_TRUE(known.count(name)) << entry.path() << " uses the class " << name;
+            }
+        }
+    }
+    uxt_theme_delete_color_table(light);
+    uxt_theme_delete_color_table(dark);
+}
+
 TEST(UxtTables, MissingOrBrokenTablesGiveNull)
 {
     TempDir tmp;
@@ -91,9 +154,35 @@ TEST(UxtWidgets, ButtonAndScreenReader)
     Evas_Object *button = uxt_button_add(win);
     ASSERT_NE(button, nullptr);
     EXPECT_STREQ(elm_object_widget_type_get(button), "Elm_Button");
-    EXPECT_EQ(uxt_access_set_screen_reader_enabled(win, false), UXT_ERROR_NONE);
-    EXPECT_FALSE(elm_config_access_get());
-    EXPECT_EQ(uxt_access_show_screen_reader_disabled_popup(win), UXT_ERROR_NONE);
     EXPECT_EQ(uxt_access_set_screen_reader_enabled(nullptr, false), UXT_ERROR_INVALID_PARAMETER);
+
+    // The notice that the screen reader is off shows once, and only when the host's screen
+    // reader (its settings key) was on.
+    TempDir tmp;
+    auto popups = [win] {
+        std::vector<Evas_Object *> found;
+        for (Evas_Object *o = evas_object_bottom_get(evas_object_evas_get(win)); o;
+             o = evas_object_above_get(o))
+            if (elm_object_widget_check(o) && !strcmp(elm_object_widget_type_get(o), "Elm_Popup"))
+                found.push_back(o);
+        return found;
+    };
+    for (int host_reader : {0, 1}) {
+        ASSERT_EQ(vconf_set_int("db/setting/accessibility/tts", host_reader), 0);
+        for (int launch = 0; launch < 2; launch++) {
+            EXPECT_EQ(uxt_access_set_screen_reader_enabled(win, false), UXT_ERROR_NONE);
+            EXPECT_FALSE(elm_config_access_get());
+            EXPECT_EQ(uxt_access_show_screen_reader_disabled_popup(win), UXT_ERROR_NONE);
+        }
+        EXPECT_EQ(popups().size(), (size_t)host_reader) << "host reader " << host_reader;
+    }
+    int host_reader = -1;
+    EXPECT_EQ(vconf_get_int("db/setting/accessibility/tts", &host_reader), 0);
+    EXPECT_EQ(host_reader, 0);
+    ASSERT_EQ(popups().size(), 1u);
+    Evas_Object *popup = popups()[0];
+    ASSERT_NE(popup, nullptr);
+    EXPECT_STREQ(elm_object_text_get(popup), i18n_get_text("IDS_ST_POP_SCREEN_READER_TURNED_OFF"));
+    EXPECT_STRNE(elm_object_text_get(popup), "IDS_ST_POP_SCREEN_READER_TURNED_OFF");
     evas_object_del(win);
 }

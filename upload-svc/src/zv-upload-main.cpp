@@ -23,7 +23,8 @@ namespace {
 
 constexpr const char kWinName[] = "zuvo-upload-svc";
 constexpr double kBaseScale = 2.6;
-// A new window on a desktop opens at a phone's size (logical pixels at scale 1).
+// A new window asks for a phone's size (logical pixels at scale 1); a window manager that
+// sizes its windows itself (full screen, a tile) has the last word.
 constexpr int kPhoneWidth = 360;
 constexpr int kPhoneHeight = 640;
 
@@ -144,8 +145,7 @@ static Evas_Object *_zv_upload_main_create_conform(Evas_Object *parent)
     return conform;
 }
 
-// The layout holds a background of its own in "elm.swallow.bg": the window's background
-// stays a resize object of the window.
+// The caller puts the window's background into the layout's "elm.swallow.bg".
 static Evas_Object *_zv_upload_main_create_layout(Evas_Object *parent)
 {
     ZV_LOG_ENTER();
@@ -160,11 +160,6 @@ static Evas_Object *_zv_upload_main_create_layout(Evas_Object *parent)
     }
     elm_layout_theme_set(layout, "layout", "application", "default");
     evas_object_size_hint_weight_set(layout, EVAS_HINT_EXPAND, EVAS_HINT_EXPAND);
-    Evas_Object *bg = elm_bg_add(layout);
-    if (bg) {
-        elm_object_part_content_set(layout, "elm.swallow.bg", bg);
-        evas_object_show(bg);
-    }
     evas_object_show(layout);
     return layout;
 }
@@ -211,6 +206,8 @@ bool create_base_gui(AppData *ad)
             g_strdup_printf("%s%s%s", res.get(), "edje/", "zuvo-upload-custom-winset.edj"),
             g_free);
         elm_theme_extension_add(nullptr, edj.get());
+        // The same file also replaces the stock styles it restyles (page, check box, popups).
+        elm_theme_overlay_add(nullptr, edj.get());
     } else {
         elm_theme_extension_add(nullptr, nullptr);
     }
@@ -233,6 +230,7 @@ bool create_base_gui(AppData *ad)
         ZV_LOGE("layout is NULL");
         return false;
     }
+    elm_object_part_content_set(ad->layout, "elm.swallow.bg", ad->bg);
     elm_object_content_set(ad->conform, ad->layout);
     ad->navi = _zv_upload_main_create_navi(ad->layout);
     if (!ad->navi)
@@ -354,6 +352,10 @@ static void _app_control(app_control_h app_control, void *data)
     if (!_zv_upload_main_get_app_control_info(app_control, ad))
         ZV_LOGE("get bundle value fail");
     zv_upload_ctrl_service(ad);
+    // A request that finds the window lowered or iconified (a click on the ongoing
+    // notification, say) brings it back to the front.
+    elm_win_iconified_set(ad->win, EINA_FALSE);
+    elm_win_raise(ad->win);
     elm_win_activate(ad->win);
 
     // One pair of key handlers at a time: a key event reaches the view once.
