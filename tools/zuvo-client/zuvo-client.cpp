@@ -44,10 +44,13 @@ const char kUsage[] =
     "      record each file as a READY upload; prints one line \"ID<TAB>PATH\" per file.\n"
     "      The title defaults to the file name without its extension. Files of 2 GiB and\n"
     "      more are refused; nothing is recorded unless every file can be read.\n"
-    "  launch --token T --category C [--description D] [--tag T]\n"
+    "  launch --token-file FILE --category C [--description D] [--tag T]\n"
     "         [--privacy public|unlisted|private] [--location]\n"
     "      send the service the launch request that uploads every READY file\n"
     "      (privacy defaults to public; --location adds the device position).\n"
+    "      The user's access token is read from FILE ('-': standard input), else from\n"
+    "      the environment variable ZV_ACCESS_TOKEN; --token T still works but shows the\n"
+    "      token to every user of the machine (ps).\n"
     "  list\n"
     "      print the history: id, title, status, percent, size, file.\n"
     "  remove ID\n"
@@ -55,7 +58,8 @@ const char kUsage[] =
     "\n"
     "Options take their value as the next argument or after '=' (--title=T); '--' ends\n"
     "the options of add. Exit status: 0 done, 1 failed, 2 wrong call or unreadable file.\n"
-    "Environment: ZV_HISTORY_DB (the history file), ZV_MEDIA_DB, ZV_RUNTIME_DIR, and\n"
+    "Environment: ZV_ACCESS_TOKEN (the token of launch), ZV_HISTORY_DB (the history\n"
+    "file), ZV_MEDIA_DB, ZV_RUNTIME_DIR, and\n"
     "ZV_DLOG_FILE: where the platform log goes (default: zuvo-client.log in the runtime\n"
     "folder, emptied once it passes 1 MiB).\n";
 
@@ -356,18 +360,61 @@ int cmd_add(int argc, char **argv)
     return 0;
 }
 
+// The access token of launch, from --token-file (a file, or '-' for standard input), else
+// --token (with a warning: the command line is public), else ZV_ACCESS_TOKEN; the line end a
+// file or pipe carries is dropped. Returns 0, or the exit status after a line on stderr.
+int read_token(Args &args, std::string *token)
+{
+    if (args.values.count("--token") && args.values.count("--token-file"))
+        return complain(kExitUsage, "launch: give --token or --token-file, not both");
+    if (args.values.count("--token-file")) {
+        const std::string &path = args.values["--token-file"];
+        FILE *f = path == "-" ? stdin : fopen(path.c_str(), "r");
+        if (!f)
+            return complain(kExitUsage, "launch: cannot read the token file '%s': %s", path.c_str(),
+                            strerror(errno));
+        char buf[4096];
+        size_t n;
+        while ((n = fread(buf, 1, sizeof buf, f)) > 0 && token->size() < 65536)
+            token->append(buf, n);
+        bool failed = ferror(f);
+        if (f != stdin)
+            fclose(f);
+        if (failed)
+            return complain(kExitUsage, "launch: cannot read the token file '%s'", path.c_str());
+        while (!token->empty() && (token->back() == '\n' || token->back() == '\r'))
+            token->pop_back();
+        if (token->empty() || token->find_first_of("\r\n") != std::string::npos)
+            return complain(kExitUsage, "launch: the token file '%s' must hold one line",
+                            path.c_str());
+        return 0;
+    }
+    if (args.values.count("--token")) {
+        *token = args.values["--token"];
+        if (!token->empty())
+            complain(0, "warning: --token shows the token to every user of this machine; "
+                        "use --token-file or ZV_ACCESS_TOKEN");
+    } else if (const char *env = getenv("ZV_ACCESS_TOKEN")) {
+        *token = env;
+    }
+    if (token->empty())
+        return complain(kExitUsage, "launch: --token-file or ZV_ACCESS_TOKEN is required");
+    return 0;
+}
+
 int cmd_launch(int argc, char **argv)
 {
     Args args;
     std::string error;
-    if (!parse_args(argc, argv, 2, {"--token", "--category", "--description", "--tag", "--privacy"},
-                    {"--location"}, &args, &error))
+    if (!parse_args(
+            argc, argv, 2,
+            {"--token", "--token-file", "--category", "--description", "--tag", "--privacy"},
+            {"--location"}, &args, &error))
         return complain(kExitUsage, "launch: %s", error.c_str());
     if (!args.positional.empty())
         return complain(kExitUsage, "launch: unexpected argument '%s'", args.positional[0].c_str());
-    for (const char *required : {"--token", "--category"})
-        if (!args.values.count(required) || args.values[required].empty())
-            return complain(kExitUsage, "launch: %s is required", required);
+    if (!args.values.count("--category") || args.values["--category"].empty())
+        return complain(kExitUsage, "launch: --category is required");
 
     static const std::map<std::string, const char *> kPrivacy = {
         {"public", "0"}, {"unlisted", "1"}, {"private", "2"}};
@@ -379,8 +426,13 @@ int cmd_launch(int argc, char **argv)
         access_type = it->second;
     }
 
+    // Last of the checks, so that a wrong call does not read standard input first.
+    std::string token;
+    if (int rc = read_token(args, &token))
+        return rc;
+
     std::vector<std::pair<const char *, std::string>> extras = {
-        {"ZV_DATA_ACCESS_TOKEN", args.values["--token"]},
+        {"ZV_DATA_ACCESS_TOKEN", token},
         {"ZV_DATA_CATEGORY", args.values["--category"]},
     };
     if (args.values.count("--description"))
@@ -398,6 +450,9 @@ int cmd_launch(int argc, char **argv)
     for (const auto &extra : extras)
         if (rc == APP_CONTROL_ERROR_NONE)
             rc = app_control_add_extra_data(request, extra.first, extra.second.c_str());
+    // A service started from here gets the token in its launch request, not from a copy in
+    // its environment.
+    unsetenv("ZV_ACCESS_TOKEN");
     if (rc == APP_CONTROL_ERROR_NONE)
         rc = app_control_send_launch_request(request, nullptr, nullptr);
     app_control_destroy(request);
