@@ -271,17 +271,36 @@ std::string title_from_name(const std::string &name)
     return (dot == std::string::npos || dot == 0) ? name : name.substr(0, dot);
 }
 
-// Registers the file in the media database with a thumbnail of one of its frames (none
-// when the host cannot make one); a failure is reported and changes nothing else.
-void register_media(const NewFile &file)
+// More files than this show a progress line while their thumbnails are made, on a terminal.
+constexpr size_t kProgressFrom = 50;
+
+void show_progress(int done, int total, void *)
 {
-    char *thumb = media_content_create_thumbnail(file.path.c_str());
-    int rc = media_content_register_file(file.path.c_str(), MEDIA_CONTENT_TYPE_VIDEO, thumb,
-                                         file.name.c_str());
-    free(thumb);
+    fprintf(stderr, "\rthumbnails: %d of %d", done, total);
+    if (done == total)
+        fputc('\n', stderr);
+}
+
+// Registers the files in the media database, each with a thumbnail of one of its frames
+// (none when the host cannot make one); the thumbnails are made side by side. A failure is
+// reported and changes nothing else.
+void register_media(const std::vector<NewFile> &files)
+{
+    std::vector<const char *> paths, names;
+    for (const NewFile &file : files) {
+        paths.push_back(file.path.c_str());
+        names.push_back(file.name.c_str());
+    }
+    std::vector<char *> thumbs(files.size(), nullptr);
+    bool progress = files.size() > kProgressFrom && isatty(STDERR_FILENO);
+    media_content_create_thumbnails(paths.data(), thumbs.data(), (int)files.size(),
+                                    progress ? show_progress : nullptr, nullptr);
+    int rc = media_content_register_files(paths.data(), MEDIA_CONTENT_TYPE_VIDEO, thumbs.data(),
+                                          names.data(), (int)files.size());
+    for (char *thumb : thumbs)
+        free(thumb);
     if (rc != MEDIA_CONTENT_ERROR_NONE)
-        complain(0, "warning: '%s' is recorded but not in the media database (error %d)",
-                 file.path.c_str(), rc);
+        complain(0, "warning: the files are recorded but not in the media database (error %d)", rc);
 }
 
 int cmd_add(int argc, char **argv)
@@ -353,10 +372,9 @@ int cmd_add(int argc, char **argv)
                             file.path.c_str());
     }
 
-    for (const NewFile &file : files) {
-        register_media(file);
+    register_media(files);
+    for (const NewFile &file : files)
         printf("%d\t%s\n", file.historyid, file.path.c_str());
-    }
     return 0;
 }
 
