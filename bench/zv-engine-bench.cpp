@@ -193,7 +193,7 @@ std::vector<pid_t> start_load(const std::string &dir)
 
 int main(int argc, char **argv)
 {
-    int size_mib = 1024, rounds = 3, requests = 10000;
+    int size_mib = 1024, rounds = 5, requests = 10000;
     std::string devserver;
     bool load = false;
     for (int i = 1; i < argc; ++i) {
