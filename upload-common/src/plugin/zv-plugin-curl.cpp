@@ -408,7 +408,14 @@ size_t _zv_curl_read_cb(char *ptr, size_t size, size_t nmemb, void *userp)
     }
     if (fseeko(item->file_stream, item->file_offset, SEEK_SET) != 0)
         ZV_LOGE("fseek fail");
-    size_t n = fread(ptr, 1, size * nmemb, item->file_stream);
+    // Never past the size the request announced (libcurl reads until a read gives 0): a file
+    // that grew meanwhile sends no byte beyond its Content-Length.
+    size_t want = size * nmemb;
+    if (item->file_offset >= item->file_size)
+        want = 0;
+    else if (want > static_cast<size_t>(item->file_size - item->file_offset))
+        want = static_cast<size_t>(item->file_size - item->file_offset);
+    size_t n = want ? fread(ptr, 1, want, item->file_stream) : 0;
     item->file_offset += static_cast<int>(n);
     if (item->progress_cb_func) {
         int percent = 100;
