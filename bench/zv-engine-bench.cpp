@@ -3,12 +3,14 @@
 // queueing on an idle engine to the first byte at the server, and resident memory during a
 // large upload and over many requests. Prints each figure with its target.
 //
-//   zv-engine-bench [--size-mib N] [--rounds N] [--requests N] [--devserver PATH]
+//   zv-engine-bench [--size-mib N] [--rounds N] [--requests N] [--devserver PATH] [--load]
 //   zv-engine-bench --sink          (the sink server: prints its port, reads and discards)
 //
 // The server is zuvo-devserver when --devserver names it (an upload address is made for each
 // upload with the metadata POST), else the sink of this program, run as a child process so
-// that its CPU is not counted as the engine's.
+// that its CPU is not counted as the engine's. --load runs the uploads beside a busy machine:
+// one process that keeps a core busy and one that keeps writing and removing small files,
+// as a phone's other applications would.
 #include <arpa/inet.h>
 #include <fcntl.h>
 #include <netinet/in.h>
@@ -17,6 +19,7 @@
 #include <stdio.h>
 #include <stdlib.h>
 #include <string.h>
+#include <sys/prctl.h>
 #include <sys/resource.h>
 #include <sys/socket.h>
 #include <sys/stat.h>
@@ -108,30 +111,6 @@ int run_sink()
     }
 }
 
-RunResult curl_upload(Target &target, const std::string &path)
-{
-    RunResult r;
-    std::string url = target.upload_url();
-    if (url.empty())
-        return r;
-    auto t0 = Clock::now();
-    pid_t pid = fork();
-    if (pid == 0) {
-        int null_fd = open("/dev/null", O_WRONLY);
-        dup2(null_fd, STDOUT_FILENO);
-        execlp("curl", "curl", "-sS", "-o", "/dev/null", "-T", path.c_str(), url.c_str(),
-               (char *)nullptr);
-        _exit(127);
-    }
-    int status = 0;
-    rusage ru{};
-    wait4(pid, &status, 0, &ru);
-    r.wall = seconds_since(t0);
-    r.cpu = cpu_seconds(ru);
-    r.ok = WIFEXITED(status) && WEXITSTATUS(status) == 0;
-    return r;
-}
-
 // A listener of this process that notes when the first byte of a connection arrives.
 class FirstByteProbe
 {
@@ -173,12 +152,50 @@ class FirstByteProbe
     int port_ = 0;
 };
 
+// The load of --load, as child processes that end with this program: a core kept busy, and
+// small files written, flushed and removed without pause in the folder given.
+std::vector<pid_t> start_load(const std::string &dir)
+{
+    std::vector<pid_t> pids;
+    for (int kind = 0; kind < 2; ++kind) {
+        pid_t pid = fork();
+        if (pid == 0) {
+            prctl(PR_SET_PDEATHSIG, SIGKILL);
+            volatile unsigned long spin = 0;
+            std::vector<char> block(64 * 1024, 'x');
+            for (unsigned long i = 0;; ++i) {
+                if (kind == 0) {
+                    for (int k = 0; k < 1000000; ++k)
+                        spin = spin + k;
+                    continue;
+                }
+                std::string file = dir + "/load-" + std::to_string(i % 64);
+                int fd = open(file.c_str(), O_WRONLY | O_CREAT | O_TRUNC, 0600);
+                if (fd >= 0) {
+                    if (write(fd, block.data(), block.size()) < 0)
+                        _exit(1);
+                    fdatasync(fd);
+                    close(fd);
+                }
+                if (i % 64 == 63)
+                    for (int k = 0; k < 64; ++k)
+                        unlink((dir + "/load-" + std::to_string(k)).c_str());
+            }
+            _exit(0);
+        }
+        if (pid > 0)
+            pids.push_back(pid);
+    }
+    return pids;
+}
+
 } // namespace
 
 int main(int argc, char **argv)
 {
-    int size_mib = 1024, rounds = 3, requests = 10000;
+    int size_mib = 1024, rounds = 5, requests = 10000;
     std::string devserver;
+    bool load = false;
     for (int i = 1; i < argc; ++i) {
         std::string a = argv[i];
         if (a == "--sink")
@@ -191,6 +208,8 @@ int main(int argc, char **argv)
             requests = atoi(argv[++i]);
         else if (a == "--devserver" && i + 1 < argc)
             devserver = argv[++i];
+        else if (a == "--load")
+            load = true;
         else {
             fprintf(stderr, "zv-engine-bench: unknown argument %s\n", argv[i]);
             return 2;
@@ -217,7 +236,10 @@ int main(int argc, char **argv)
             block[i] = static_cast<char>(i * 131 + (i >> 13));
         for (long long left = size; f && left > 0; left -= static_cast<long long>(block.size()))
             fwrite(block.data(), 1, std::min<long long>(left, block.size()), f);
-        if (!f || fclose(f) != 0) {
+        // On the disk before the first round: else the kernel writes the file back half a
+        // minute later, in the middle of whichever upload runs then, and that round's figure
+        // is the disk's.
+        if (!f || fflush(f) != 0 || fsync(fileno(f)) != 0 || fclose(f) != 0) {
             perror("writing the upload file");
             return 1;
         }
@@ -247,8 +269,12 @@ int main(int argc, char **argv)
         return 1;
     }
     target.base = "http://127.0.0.1:" + std::to_string(port);
-    printf("server: %s on port %d; file %d MiB; %d rounds\n",
-           target.devserver ? "zuvo-devserver" : "sink", port, size_mib, rounds);
+    printf("server: %s on port %d; file %d MiB; %d rounds%s\n",
+           target.devserver ? "zuvo-devserver" : "sink", port, size_mib, rounds,
+           load ? "; under load (a busy core, small files written)" : "");
+    std::vector<pid_t> load_pids;
+    if (load)
+        load_pids = start_load(dir);
 
     zv_curl_init_service();
     int failures = 0;
@@ -281,26 +307,37 @@ int main(int argc, char **argv)
         curl_rate.push_back(size / c.wall / (1 << 20));
         engine_cpu.push_back(e.cpu / gib);
         curl_cpu.push_back(c.cpu / gib);
-        printf("  round %d: engine %.0f MiB/s %.2f s CPU, curl %.0f MiB/s %.2f s CPU\n", i,
-               engine_rate.back(), e.cpu, curl_rate.back(), c.cpu);
+        printf("  round %d: engine %.0f MiB/s %.2f s CPU, curl %.0f MiB/s %.2f s CPU: %.2fx\n",
+               i, engine_rate.back(), e.cpu, curl_rate.back(), c.cpu, rate_ratio.back());
+    }
+    for (pid_t pid : load_pids) {
+        kill(pid, SIGTERM);
+        waitpid(pid, nullptr, 0);
     }
     bool all_pass = failures == 0;
     if (!engine_rate.empty()) {
         // Each figure is the median of the rounds' own ratios (a round's two uploads share
         // the machine's conditions), beside the medians of the plain numbers.
         double ratio = median(rate_ratio);
-        bool pass = ratio >= 0.9;
+        bool pass = ratio >= 0.95;
         all_pass &= pass;
         report("upload throughput (median)",
                fmt("engine %.0f MiB/s, curl %.0f MiB/s: %.2fx", median(engine_rate),
                    median(curl_rate), ratio),
-               ">= 0.90x", pass);
+               ">= 0.95x", pass);
+        double lowest = *std::min_element(rate_ratio.begin(), rate_ratio.end());
+        pass = lowest >= 0.8;
+        all_pass &= pass;
+        report("upload throughput (lowest round)",
+               fmt("%.2fx (highest %.2fx)", lowest,
+                   *std::max_element(rate_ratio.begin(), rate_ratio.end())),
+               ">= 0.80x", pass);
         double cpu = median(cpu_ratio);
-        pass = cpu <= 1.5;
+        pass = cpu <= 1.0;
         all_pass &= pass;
         report("CPU user+sys per GiB (median)",
                fmt("engine %.2f s, curl %.2f s: %.2fx", median(engine_cpu), median(curl_cpu), cpu),
-               "<= 1.50x", pass);
+               "<= 1.00x", pass);
         bool rss_pass = rss_growth < 32 * 1024;
         all_pass &= rss_pass;
         report("resident memory during upload",

@@ -1,20 +1,25 @@
 // Host media content database: rows of (path, media type, thumbnail path, display name) in
 // the SQLite file ZV_MEDIA_DB, filter conditions read into terms whose values are bound as
-// parameters, and video thumbnails made by GStreamer's gst-launch-1.0.
+// parameters, and video thumbnails decoded in this process by GStreamer, several at a time.
 #include "media_content.h"
 
 #include <errno.h>
+#include <fcntl.h>
 #include <glib.h>
 #include <glib/gstdio.h>
+#include <gst/gst.h>
 #include <sqlite3.h>
 #include <stdlib.h>
 #include <string.h>
 #include <unistd.h>
 
+#include <algorithm>
+#include <atomic>
 #include <memory>
 #include <mutex>
 #include <optional>
 #include <string>
+#include <thread>
 #include <vector>
 
 #include "zv-log.h"
@@ -23,7 +28,8 @@ namespace
 {
 
 const int kBusyTimeoutMs = 2000;
-const char kThumbTimeoutSeconds[] = "30";
+// A video whose frame is not decoded within this time gets no thumbnail.
+const GstClockTime kThumbTimeout = 2 * GST_SECOND;
 const int kThumbWidth = 320;
 
 enum class Column { Path, Type, DisplayName, ThumbnailPath };
@@ -265,18 +271,123 @@ bool is_png(const gchar *data, gsize len)
     return len > sizeof signature && memcmp(data, signature, sizeof signature) == 0;
 }
 
-// Removes the scratch folder of one thumbnail and what it holds.
-struct ScratchDir {
-    std::string path;
-    ~ScratchDir()
-    {
-        if (path.empty())
-            return;
-        g_unlink((path + "/in").c_str());
-        g_unlink((path + "/out.png").c_str());
-        g_rmdir(path.c_str());
-    }
+struct GstUnref {
+    void operator()(gpointer object) const { gst_object_unref(object); }
 };
+using GstPtr = std::unique_ptr<GstElement, GstUnref>;
+using GstBusPtr = std::unique_ptr<GstBus, GstUnref>;
+
+struct GstMessageUnref {
+    void operator()(GstMessage *msg) const { gst_message_unref(msg); }
+};
+using GstMessagePtr = std::unique_ptr<GstMessage, GstMessageUnref>;
+
+// GStreamer, started once per process; false (logged) when it cannot start.
+bool gstreamer_ready()
+{
+    static std::once_flag once;
+    static bool ready = false;
+    std::call_once(once, [] {
+        GError *error = nullptr;
+        ready = gst_init_check(nullptr, nullptr, &error);
+        if (!ready) {
+            ZV_LOGW("no thumbnails: GStreamer does not start (%s)",
+                    error ? error->message : "unknown error");
+            g_clear_error(&error);
+        }
+    });
+    return ready;
+}
+
+// The PNG the encoder hands over, on a streaming thread; read once the pipeline is stopped.
+void keep_png(GstElement *, GstBuffer *buffer, GstPad *, gpointer data)
+{
+    GstMapInfo map;
+    if (!gst_buffer_map(buffer, &map, GST_MAP_READ))
+        return;
+    static_cast<std::string *>(data)->assign(reinterpret_cast<const char *>(map.data), map.size);
+    gst_buffer_unmap(buffer, &map);
+}
+
+// Decodes the first frame of the video at path, scaled to kThumbWidth, into PNG bytes. The
+// path is set as a property, never parsed as pipeline text. False when the file does not
+// decode, or not within kThumbTimeout.
+bool decode_png(const char *path, std::string *png)
+{
+    GError *error = nullptr;
+    GstPtr pipeline(gst_parse_launch(
+        "filesrc name=src ! decodebin ! videoconvert ! videoscale ! capsfilter name=caps "
+        "! pngenc snapshot=true compression-level=1 ! fakesink name=sink signal-handoffs=true sync=false",
+        &error));
+    if (!pipeline || error) {
+        ZV_LOGW("no thumbnail pipeline: %s", error ? error->message : "unknown error");
+        g_clear_error(&error);
+        return false;
+    }
+    GstBin *bin = GST_BIN(pipeline.get());
+    GstPtr src(gst_bin_get_by_name(bin, "src"));
+    GstPtr filter(gst_bin_get_by_name(bin, "caps"));
+    GstPtr sink(gst_bin_get_by_name(bin, "sink"));
+    if (!src || !filter || !sink)
+        return false;
+    g_object_set(src.get(), "location", path, nullptr);
+    GstCaps *caps =
+        gst_caps_new_simple("video/x-raw", "format", G_TYPE_STRING, "RGB", "width", G_TYPE_INT,
+                            kThumbWidth, "pixel-aspect-ratio", GST_TYPE_FRACTION, 1, 1, nullptr);
+    g_object_set(filter.get(), "caps", caps, nullptr);
+    gst_caps_unref(caps);
+    g_signal_connect(sink.get(), "handoff", G_CALLBACK(keep_png), png);
+
+    bool done = false;
+    if (gst_element_set_state(pipeline.get(), GST_STATE_PLAYING) != GST_STATE_CHANGE_FAILURE) {
+        GstBusPtr bus(gst_element_get_bus(pipeline.get()));
+        GstMessagePtr msg(gst_bus_timed_pop_filtered(
+            bus.get(), kThumbTimeout,
+            static_cast<GstMessageType>(GST_MESSAGE_EOS | GST_MESSAGE_ERROR)));
+        done = msg && GST_MESSAGE_TYPE(msg.get()) == GST_MESSAGE_EOS;
+        if (!msg)
+            ZV_LOGW("no thumbnail for %s: no frame within %d s", path,
+                    static_cast<int>(kThumbTimeout / GST_SECOND));
+    }
+    // Stopping joins the streaming threads: nothing writes *png afterwards.
+    gst_element_set_state(pipeline.get(), GST_STATE_NULL);
+    return done;
+}
+
+// The thumbnail of one video, as media_content_create_thumbnail answers it.
+char *make_thumbnail(const char *video_path)
+{
+    if (!video_path || !*video_path || !gstreamer_ready())
+        return nullptr;
+    GCharPtr absolute(g_canonicalize_filename(video_path, nullptr));
+    if (!g_file_test(absolute.get(), G_FILE_TEST_IS_REGULAR))
+        return nullptr;
+
+    std::string png;
+    if (!decode_png(absolute.get(), &png) || !is_png(png.data(), png.size())) {
+        ZV_LOGW("no thumbnail for %s: the frame could not be decoded", absolute.get());
+        return nullptr;
+    }
+
+    std::string dir = thumbs_dir();
+    if (g_mkdir_with_parents(dir.c_str(), 0700) != 0)
+        return nullptr;
+    GCharPtr digest(g_compute_checksum_for_string(G_CHECKSUM_SHA1, absolute.get(), -1));
+    std::string thumb = dir + "/" + digest.get() + ".png";
+    // Replaced whole through a rename (a reader never sees half a picture); a thumbnail lost
+    // at a power cut is made again at the next add, so there is no flush to the disk.
+    std::string tmp = thumb + ".XXXXXX";
+    int fd = g_mkstemp_full(&tmp[0], O_WRONLY | O_CLOEXEC, 0600);
+    if (fd < 0)
+        return nullptr;
+    bool written = write(fd, png.data(), png.size()) == (ssize_t)png.size();
+    if (close(fd) != 0 || !written || g_rename(tmp.c_str(), thumb.c_str()) != 0) {
+        g_unlink(tmp.c_str());
+        return nullptr;
+    }
+    GCharPtr thumb_abs(g_canonicalize_filename(thumb.c_str(), nullptr));
+    return strdup(thumb_abs.get());
+}
 
 } // namespace
 
@@ -469,9 +580,19 @@ int media_info_get_media_type(media_info_h media, media_content_type_e *type)
 int media_content_register_file(const char *file_path, media_content_type_e type,
                                 const char *thumbnail_path, const char *display_name)
 {
-    if (!file_path || !*file_path || type < MEDIA_CONTENT_TYPE_IMAGE ||
+    return media_content_register_files(&file_path, type, &thumbnail_path, &display_name, 1);
+}
+
+int media_content_register_files(const char *const *file_paths, media_content_type_e type,
+                                 const char *const *thumbnail_paths,
+                                 const char *const *display_names, int count)
+{
+    if (count < 0 || (count > 0 && !file_paths) || type < MEDIA_CONTENT_TYPE_IMAGE ||
         type > MEDIA_CONTENT_TYPE_OTHERS)
         return MEDIA_CONTENT_ERROR_INVALID_PARAMETER;
+    for (int i = 0; i < count; ++i)
+        if (!file_paths[i] || !*file_paths[i])
+            return MEDIA_CONTENT_ERROR_INVALID_PARAMETER;
 
     std::string path = media_db_path();
     GCharPtr dir(g_path_get_dirname(path.c_str()));
@@ -500,19 +621,30 @@ int media_content_register_file(const char *file_path, media_content_type_e type
         "display_name = excluded.display_name";
     sqlite3_stmt *stmt_raw = nullptr;
     if (sqlite3_exec(db.get(), create_sql, nullptr, nullptr, nullptr) != SQLITE_OK ||
+        sqlite3_exec(db.get(), "BEGIN IMMEDIATE", nullptr, nullptr, nullptr) != SQLITE_OK ||
         sqlite3_prepare_v2(db.get(), insert_sql, -1, &stmt_raw, nullptr) != SQLITE_OK) {
         ZV_LOGE("media database %s: %s", path.c_str(), sqlite3_errmsg(db.get()));
-        return MEDIA_CONTENT_ERROR_DB_FAILED;
+        return sqlite3_errcode(db.get()) == SQLITE_BUSY ? MEDIA_CONTENT_ERROR_DB_BUSY
+                                                        : MEDIA_CONTENT_ERROR_DB_FAILED;
     }
     StmtPtr stmt(stmt_raw);
-    sqlite3_bind_text(stmt.get(), 1, file_path, -1, SQLITE_TRANSIENT);
-    sqlite3_bind_int(stmt.get(), 2, (int)type);
-    if (thumbnail_path)
-        sqlite3_bind_text(stmt.get(), 3, thumbnail_path, -1, SQLITE_TRANSIENT);
-    if (display_name)
-        sqlite3_bind_text(stmt.get(), 4, display_name, -1, SQLITE_TRANSIENT);
-    rc = sqlite3_step(stmt.get());
-    if (rc != SQLITE_DONE) {
+    rc = SQLITE_DONE;
+    for (int i = 0; i < count && rc == SQLITE_DONE; ++i) {
+        sqlite3_reset(stmt.get());
+        sqlite3_clear_bindings(stmt.get());
+        sqlite3_bind_text(stmt.get(), 1, file_paths[i], -1, SQLITE_STATIC);
+        sqlite3_bind_int(stmt.get(), 2, (int)type);
+        if (thumbnail_paths && thumbnail_paths[i])
+            sqlite3_bind_text(stmt.get(), 3, thumbnail_paths[i], -1, SQLITE_STATIC);
+        if (display_names && display_names[i])
+            sqlite3_bind_text(stmt.get(), 4, display_names[i], -1, SQLITE_STATIC);
+        rc = sqlite3_step(stmt.get());
+    }
+    stmt.reset();
+    // Nothing of a batch stays when one of its rows fails (the transaction is rolled back
+    // when the connection closes without a commit).
+    if (rc != SQLITE_DONE ||
+        (rc = sqlite3_exec(db.get(), "COMMIT", nullptr, nullptr, nullptr)) != SQLITE_OK) {
         ZV_LOGE("media database %s: %s", path.c_str(), sqlite3_errmsg(db.get()));
         return rc == SQLITE_BUSY ? MEDIA_CONTENT_ERROR_DB_BUSY : MEDIA_CONTENT_ERROR_DB_FAILED;
     }
@@ -521,78 +653,34 @@ int media_content_register_file(const char *file_path, media_content_type_e type
 
 char *media_content_create_thumbnail(const char *video_path)
 {
-    if (!video_path || !*video_path)
-        return nullptr;
-    GCharPtr absolute(g_canonicalize_filename(video_path, nullptr));
-    if (!g_file_test(absolute.get(), G_FILE_TEST_IS_REGULAR))
-        return nullptr;
+    return make_thumbnail(video_path);
+}
 
-    // gst-launch-1.0 reads its pipeline as text, so it never sees a path: it runs in a
-    // scratch folder where "in" links to the video and "out.png" is written.
-    ScratchDir scratch;
-    GCharPtr tmpl(g_build_filename(g_get_tmp_dir(), "zv-thumb-XXXXXX", nullptr));
-    if (!g_mkdtemp(tmpl.get()))
-        return nullptr;
-    scratch.path = tmpl.get();
-    if (symlink(absolute.get(), (scratch.path + "/in").c_str()) != 0)
-        return nullptr;
-
-    std::string caps =
-        "video/x-raw,format=RGB,width=" + std::to_string(kThumbWidth) + ",pixel-aspect-ratio=1/1";
-    const char *argv[] = {"timeout",
-                          "-k",
-                          "2",
-                          kThumbTimeoutSeconds,
-                          "gst-launch-1.0",
-                          "-q",
-                          "filesrc",
-                          "location=in",
-                          "!",
-                          "decodebin",
-                          "!",
-                          "videoconvert",
-                          "!",
-                          "videoscale",
-                          "!",
-                          caps.c_str(),
-                          "!",
-                          "pngenc",
-                          "snapshot=true",
-                          "!",
-                          "filesink",
-                          "location=out.png",
-                          nullptr};
-    gint status = 0;
-    GError *error = nullptr;
-    gboolean spawned = g_spawn_sync(scratch.path.c_str(), const_cast<gchar **>(argv), nullptr,
-                                    (GSpawnFlags)(G_SPAWN_SEARCH_PATH | G_SPAWN_STDOUT_TO_DEV_NULL |
-                                                  G_SPAWN_STDERR_TO_DEV_NULL),
-                                    nullptr, nullptr, nullptr, nullptr, &status, &error);
-    if (!spawned) {
-        ZV_LOGW("no thumbnail for %s: %s", absolute.get(), error->message);
-        g_error_free(error);
-        return nullptr;
-    }
-    if (!g_spawn_check_wait_status(status, nullptr)) {
-        ZV_LOGW("no thumbnail for %s: the frame could not be decoded", absolute.get());
-        return nullptr;
-    }
-
-    gchar *data = nullptr;
-    gsize len = 0;
-    if (!g_file_get_contents((scratch.path + "/out.png").c_str(), &data, &len, nullptr))
-        return nullptr;
-    GCharPtr png(data);
-    if (!is_png(data, len))
-        return nullptr;
-
-    std::string dir = thumbs_dir();
-    if (g_mkdir_with_parents(dir.c_str(), 0700) != 0)
-        return nullptr;
-    GCharPtr digest(g_compute_checksum_for_string(G_CHECKSUM_SHA1, absolute.get(), -1));
-    std::string thumb = dir + "/" + digest.get() + ".png";
-    if (!g_file_set_contents(thumb.c_str(), data, (gssize)len, nullptr))
-        return nullptr;
-    GCharPtr thumb_abs(g_canonicalize_filename(thumb.c_str(), nullptr));
-    return strdup(thumb_abs.get());
+int media_content_create_thumbnails(const char *const *video_paths, char **thumbnail_paths,
+                                    int count, media_thumbnail_progress_cb progress,
+                                    void *user_data)
+{
+    if (count < 0 || (count > 0 && (!video_paths || !thumbnail_paths)))
+        return MEDIA_CONTENT_ERROR_INVALID_PARAMETER;
+    // One decoder per core; each takes the next file until none is left.
+    int workers = std::min<int>(count, std::max(1u, std::thread::hardware_concurrency()));
+    std::atomic<int> next{0};
+    std::mutex progress_lock;
+    int done = 0;
+    auto work = [&] {
+        for (int i; (i = next++) < count;) {
+            thumbnail_paths[i] = make_thumbnail(video_paths[i]);
+            if (progress) {
+                std::lock_guard<std::mutex> lock(progress_lock);
+                progress(++done, count, user_data);
+            }
+        }
+    };
+    std::vector<std::thread> threads;
+    for (int w = 1; w < workers; ++w)
+        threads.emplace_back(work);
+    work();
+    for (std::thread &t : threads)
+        t.join();
+    return MEDIA_CONTENT_ERROR_NONE;
 }

@@ -81,10 +81,27 @@ int media_content_register_file(const char *file_path, media_content_type_e type
 
 // Host side: makes a PNG thumbnail of one frame of the video at video_path, in the folder
 // "thumbs" beside the media database, and returns its path (a new text the caller frees).
-// NULL when the host cannot make one (no GStreamer, not a video, a decoder failure or a
-// time-out): the caller then registers the file without a thumbnail. Blocks while the frame
-// is decoded (a few seconds at most, bounded).
+// NULL when the host cannot make one (no GStreamer, not a video, a decoder failure, or no
+// frame within 2 s): the caller then registers the file without a thumbnail. Blocks while
+// the frame is decoded (2 s at most).
 char *media_content_create_thumbnail(const char *video_path);
+
+// Called after each thumbnail of a batch, done of total, one call at a time (from any of the
+// batch's threads).
+typedef void (*media_thumbnail_progress_cb)(int done, int total, void *user_data);
+
+// Host side: media_content_create_thumbnail for count videos, one per core at a time;
+// thumbnail_paths[i] receives the answer for video_paths[i]. progress may be NULL. Returns
+// once every file has its answer.
+int media_content_create_thumbnails(const char *const *video_paths, char **thumbnail_paths,
+                                    int count, media_thumbnail_progress_cb progress,
+                                    void *user_data);
+
+// Host side: media_content_register_file for count files in one transaction (one commit for
+// the lot); thumbnail_paths and display_names may be NULL or hold NULL entries.
+int media_content_register_files(const char *const *file_paths, media_content_type_e type,
+                                 const char *const *thumbnail_paths,
+                                 const char *const *display_names, int count);
 
 #ifdef __cplusplus
 }

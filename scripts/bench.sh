@@ -1,10 +1,12 @@
 #!/usr/bin/env bash
 # Builds and runs the benchmarks, printing each figure with its target: the transfer engine
-# (zv-engine-bench) and the whole service (zv-service-bench).
+# (zv-engine-bench) against zuvo-devserver and against the benchmark's own sink server, quiet
+# and under load; the whole service (zv-service-bench); and the companion recording many
+# videos with their thumbnails.
 # ZV_BENCH_BUILD: the build folder (default build/). Arguments go to zv-engine-bench
 # (--size-mib N, --rounds N, --requests N); ZV_SERVICE_BENCH_ARGS to zv-service-bench
-# (--size-mib N, --jobs N, --job-mib N, --rows N). The engine's server is zuvo-devserver when
-# the build has it, else the benchmark's own sink server.
+# (--size-mib N, --jobs N, --job-mib N, --rows N); ZV_COMPANION_BENCH_FILES the numbers of
+# videos the companion records (default "200 1000").
 set -euo pipefail
 cd "$(dirname "$0")/.."
 
@@ -14,15 +16,58 @@ if [ ! -f "$build/CMakeCache.txt" ]; then
 fi
 cmake --build "$build" -j"$(nproc)" --target zv-engine-bench zv-service-bench zuvo-upload-svc \
   zuvo-client zv-vconf zv-keystore zv_resources
+devserver=()
 if cmake --build "$build" -j"$(nproc)" --target zuvo-devserver >/dev/null 2>&1 \
    && [ -x "$build/bin/zuvo-devserver" ]; then
-  set -- --devserver "$build/bin/zuvo-devserver" "$@"
+  devserver=(--devserver "$build/bin/zuvo-devserver")
 fi
 
-echo "== transfer engine =="
+# What else runs on the machine shows in its load.
+echo "machine: $(nproc) cores, load average $(cut -d' ' -f1-3 /proc/loadavg)"
+
+echo
+echo "== transfer engine, against the benchmark's sink server =="
 "$build/bin/zv-engine-bench" "$@"
+if [ ${#devserver[@]} -gt 0 ]; then
+  echo
+  echo "== transfer engine, against zuvo-devserver =="
+  "$build/bin/zv-engine-bench" "${devserver[@]}" "$@"
+fi
+echo
+echo "== transfer engine under load, against the sink server =="
+"$build/bin/zv-engine-bench" --load --requests 0 "$@"
+if [ ${#devserver[@]} -gt 0 ]; then
+  echo
+  echo "== transfer engine under load, against zuvo-devserver =="
+  "$build/bin/zv-engine-bench" "${devserver[@]}" --load --requests 0 "$@"
+fi
 
 echo
 echo "== upload service =="
 # shellcheck disable=SC2086
 "$build/bin/zv-service-bench" ${ZV_SERVICE_BENCH_ARGS:-}
+
+echo
+echo "== companion: recording videos with thumbnails =="
+work="$(mktemp -d /tmp/zv-companion-bench-XXXXXX)"
+trap 'rm -rf "$work"' EXIT
+# One short real video (a second of 320x240 frames), copied under a name of its own per row.
+gst-launch-1.0 -q videotestsrc num-buffers=25 \
+  ! video/x-raw,format=I420,width=320,height=240,framerate=25/1 ! jpegenc ! matroskamux \
+  ! filesink location="$work/clip.mkv" >/dev/null
+for count in ${ZV_COMPANION_BENCH_FILES:-200 1000}; do
+  world="$work/$count"
+  mkdir -p "$world/videos"
+  for i in $(seq 1 "$count"); do cp "$work/clip.mkv" "$world/videos/v$i.mkv"; done
+  t0=$(date +%s.%N)
+  ZV_RUNTIME_DIR="$world/run" ZV_HISTORY_DB="$world/history.db" ZV_MEDIA_DB="$world/media.db" \
+    ZV_DLOG_FILE="$world/client.log" "$build/bin/zuvo-client" add "$world"/videos/*.mkv >/dev/null
+  t1=$(date +%s.%N)
+  thumbs=$(find "$world/thumbs" -name '*.png' 2>/dev/null | wc -l)
+  case $count in 200) target=2 ;; 1000) target=10 ;; *) target=$((count / 100)) ;; esac
+  awk -v n="$count" -v s="$t1" -v s0="$t0" -v th="$thumbs" -v t="$target" 'BEGIN {
+    s -= s0
+    pass = (s < t && th == n) ? "PASS" : "MISS"
+    printf "%-34s %-44s target %-14s %s\n", "companion add, " n " videos", \
+      sprintf("%.2f s, %d thumbnails", s, th), "< " t " s", pass }'
+done

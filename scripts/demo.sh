@@ -180,7 +180,7 @@ fi
 # The service keeps the standard error of the launch as its own: the toolkit's complaints
 # about missing desktop services go to a file, not into the progress line.
 launch() {
-  "$bin/zuvo-client" launch --token "$token" --category People \
+  ZV_ACCESS_TOKEN="$token" "$bin/zuvo-client" launch --category People \
     --description "Made by the ZuVo demo" --tag demo --privacy unlisted 2>>"$work/service.err"
 }
 

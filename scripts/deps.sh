@@ -6,7 +6,7 @@ ZV_DEB_PACKAGES=(
   libgtest-dev libgmock-dev
   libmicrohttpd-dev libssl-dev openssl
   gettext curl xvfb xauth matchbox-window-manager xdotool clang libclang-rt-14-dev
-  gstreamer1.0-tools gstreamer1.0-plugins-base gstreamer1.0-plugins-good
+  libgstreamer1.0-dev gstreamer1.0-tools gstreamer1.0-plugins-base gstreamer1.0-plugins-good
   dbus-daemon iproute2
 )
 

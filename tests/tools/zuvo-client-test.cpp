@@ -5,10 +5,12 @@
 #include <gtest/gtest.h>
 #include <media_content.h>
 #include <poll.h>
+#include <signal.h>
 #include <string.h>
 #include <sys/socket.h>
 #include <sys/stat.h>
 #include <sys/un.h>
+#include <sys/wait.h>
 #include <unistd.h>
 
 #include <algorithm>
@@ -44,13 +46,13 @@ class ZuvoClientTest : public ::testing::Test
 
     // Runs the client; its standard error goes to a file read into *err.
     int client(const std::vector<std::string> &args, std::string *out = nullptr,
-               std::string *err = nullptr)
+               std::string *err = nullptr, const std::string &input = "")
     {
         std::string err_file = tmp_.file("stderr");
         std::vector<std::string> argv = {"/bin/sh", "-c", "exec \"$0\" \"$@\" 2>'" + err_file + "'",
                                          zv_test::bin_path("zuvo-client")};
         argv.insert(argv.end(), args.begin(), args.end());
-        int status = zv_test::run_program(argv, "", out);
+        int status = zv_test::run_program(argv, input, out);
         if (err)
             *err = zv_test::read_file(err_file);
         return status;
@@ -184,6 +186,8 @@ TEST_F(ZuvoClientTest, WrongCallsExitTwoAndRecordNothing)
         {"launch", "--category", "c"},
         {"launch", "--token", "t", "--category", "c", "--privacy", "secret"},
         {"launch", "--token", "t", "--category", "c", "stray"},
+        {"launch", "--token-file", "missing", "--category", "c"},
+        {"launch", "--token-file", "good.mp4", "--token", "t", "--category", "c"},
     };
     if (geteuid() != 0) {
         ASSERT_TRUE(zv_test::write_file(tmp_.file("locked.mp4"), "x"));
@@ -261,12 +265,30 @@ TEST_F(ZuvoClientTest, LaunchSendsTheBatchExtras)
     struct Case {
         std::vector<std::string> args;
         Extras expected;
+        std::string input = "", env_token = "";
     };
+    ASSERT_TRUE(zv_test::write_file(tmp_.file("token"), "from-file\n"));
     const Case cases[] = {
         {{"--token", "tok", "--category", "People"},
          {{"ZV_DATA_ACCESS_TOKEN", "tok"},
           {"ZV_DATA_CATEGORY", "People"},
           {"ZV_DATA_ACCESS_TYPE", "0"}}},
+        // The safe forms: a file, standard input, the environment.
+        {{"--token-file", "token", "--category", "c"},
+         {{"ZV_DATA_ACCESS_TOKEN", "from-file"},
+          {"ZV_DATA_CATEGORY", "c"},
+          {"ZV_DATA_ACCESS_TYPE", "0"}}},
+        {{"--token-file=-", "--category", "c"},
+         {{"ZV_DATA_ACCESS_TOKEN", "piped"},
+          {"ZV_DATA_CATEGORY", "c"},
+          {"ZV_DATA_ACCESS_TYPE", "0"}},
+         "piped\n"},
+        {{"--category", "c"},
+         {{"ZV_DATA_ACCESS_TOKEN", "from-env"},
+          {"ZV_DATA_CATEGORY", "c"},
+          {"ZV_DATA_ACCESS_TYPE", "0"}},
+         "",
+         "from-env"},
         {{"--category=Music", "--token", "t2", "--description", "two words", "--tag", "a,b",
           "--privacy", "private", "--location"},
          {{"ZV_DATA_ACCESS_TOKEN", "t2"},
@@ -297,10 +319,78 @@ TEST_F(ZuvoClientTest, LaunchSendsTheBatchExtras)
         std::vector<std::string> args = {"launch"};
         args.insert(args.end(), c.args.begin(), c.args.end());
         std::string err;
-        EXPECT_EQ(client(args, nullptr, &err), 0) << err;
+        if (!c.env_token.empty())
+            setenv("ZV_ACCESS_TOKEN", c.env_token.c_str(), 1);
+        EXPECT_EQ(client(args, nullptr, &err, c.input), 0) << err;
+        unsetenv("ZV_ACCESS_TOKEN");
         EXPECT_EQ(served.get(), c.expected);
+        // Only the token on the command line warns, in one line.
+        if (std::find(c.args.begin(), c.args.end(), "--token") != c.args.end()) {
+            EXPECT_EQ(err.rfind("zuvo-client: warning: --token", 0), 0u) << err;
+            EXPECT_EQ(std::count(err.begin(), err.end(), '\n'), 1) << err;
+        } else {
+            EXPECT_EQ(err, "");
+        }
     }
     close(fd);
+}
+
+// The command line of every process is public (ps): with the token in a file, on standard
+// input or in the environment, neither the companion nor the service it starts shows it there.
+TEST_F(ZuvoClientTest, TokenStaysOffTheCommandLinesOfClientAndService)
+{
+    std::string sock_path = tmp_.file("run") + "/zuvo-upload-svc.sock";
+    auto cmdline = [](pid_t pid) {
+        return zv_test::read_file("/proc/" + std::to_string(pid) + "/cmdline");
+    };
+    for (bool from_stdin : {true, false}) {
+        SCOPED_TRACE(from_stdin ? "--token-file -" : "ZV_ACCESS_TOKEN");
+        const std::string token = from_stdin ? "secret-piped-1" : "secret-env-2";
+        int in[2];
+        ASSERT_EQ(pipe(in), 0);
+        if (!from_stdin)
+            setenv("ZV_ACCESS_TOKEN", token.c_str(), 1);
+        pid_t companion = fork();
+        if (companion == 0) {
+            dup2(in[0], STDIN_FILENO);
+            close(in[1]);
+            std::string prog = zv_test::bin_path("zuvo-client");
+            execl(prog.c_str(), prog.c_str(), "launch", "--category", "c",
+                  from_stdin ? "--token-file=-" : nullptr, (char *)nullptr);
+            _exit(127);
+        }
+        unsetenv("ZV_ACCESS_TOKEN");
+        close(in[0]);
+        ASSERT_GT(companion, 0);
+        // With the token still to come on its standard input, the companion is running.
+        if (from_stdin) {
+            EXPECT_TRUE(zv_test::wait_for(
+                [&] { return cmdline(companion).find("launch") != std::string::npos; }));
+            EXPECT_EQ(cmdline(companion).find("secret"), std::string::npos);
+        }
+        ASSERT_EQ(write(in[1], (token + "\n").data(), token.size() + 1), (ssize_t)token.size() + 1);
+        close(in[1]);
+        int status = 0;
+        ASSERT_EQ(waitpid(companion, &status, 0), companion);
+        ASSERT_TRUE(WIFEXITED(status) && WEXITSTATUS(status) == 0);
+
+        // The service it started listens on its socket; the peer's credentials name it.
+        int fd = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
+        struct sockaddr_un addr = {};
+        addr.sun_family = AF_UNIX;
+        memcpy(addr.sun_path, sock_path.c_str(), sock_path.size() + 1);
+        ASSERT_TRUE(zv_test::wait_for(
+            [&] { return connect(fd, (struct sockaddr *)&addr, sizeof addr) == 0; }, 30000));
+        struct ucred cred = {};
+        socklen_t len = sizeof cred;
+        ASSERT_EQ(getsockopt(fd, SOL_SOCKET, SO_PEERCRED, &cred, &len), 0);
+        close(fd);
+        std::string service_cmdline = cmdline(cred.pid);
+        EXPECT_NE(service_cmdline.find("zuvo-upload-svc"), std::string::npos);
+        EXPECT_EQ(service_cmdline.find("secret"), std::string::npos) << service_cmdline;
+        ASSERT_EQ(kill(cred.pid, SIGTERM), 0);
+        EXPECT_TRUE(zv_test::wait_for([&] { return cmdline(cred.pid).empty(); }, 30000));
+    }
 }
 
 } // namespace

@@ -45,10 +45,13 @@ const char kUsage[] =
     "      The title defaults to the file name without its extension. Empty files and\n"
     "      files of 2 GiB and more are refused; nothing is recorded unless every file can\n"
     "      be read.\n"
-    "  launch --token T --category C [--description D] [--tag T]\n"
+    "  launch --token-file FILE --category C [--description D] [--tag T]\n"
     "         [--privacy public|unlisted|private] [--location]\n"
     "      send the service the launch request that uploads every READY file\n"
     "      (privacy defaults to public; --location adds the device position).\n"
+    "      The user's access token is read from FILE ('-': standard input), else from\n"
+    "      the environment variable ZV_ACCESS_TOKEN; --token T still works but shows the\n"
+    "      token to every user of the machine (ps).\n"
     "  list\n"
     "      print the history: id, title, status, percent, size, file.\n"
     "  remove ID\n"
@@ -56,7 +59,8 @@ const char kUsage[] =
     "\n"
     "Options take their value as the next argument or after '=' (--title=T); '--' ends\n"
     "the options of add. Exit status: 0 done, 1 failed, 2 wrong call or unreadable file.\n"
-    "Environment: ZV_HISTORY_DB (the history file), ZV_MEDIA_DB, ZV_RUNTIME_DIR, and\n"
+    "Environment: ZV_ACCESS_TOKEN (the token of launch), ZV_HISTORY_DB (the history\n"
+    "file), ZV_MEDIA_DB, ZV_RUNTIME_DIR, and\n"
     "ZV_DLOG_FILE: where the platform log goes (default: zuvo-client.log in the runtime\n"
     "folder, emptied once it passes 1 MiB).\n";
 
@@ -270,17 +274,36 @@ std::string title_from_name(const std::string &name)
     return (dot == std::string::npos || dot == 0) ? name : name.substr(0, dot);
 }
 
-// Registers the file in the media database with a thumbnail of one of its frames (none
-// when the host cannot make one); a failure is reported and changes nothing else.
-void register_media(const NewFile &file)
+// More files than this show a progress line while their thumbnails are made, on a terminal.
+constexpr size_t kProgressFrom = 50;
+
+void show_progress(int done, int total, void *)
 {
-    char *thumb = media_content_create_thumbnail(file.path.c_str());
-    int rc = media_content_register_file(file.path.c_str(), MEDIA_CONTENT_TYPE_VIDEO, thumb,
-                                         file.name.c_str());
-    free(thumb);
+    fprintf(stderr, "\rthumbnails: %d of %d", done, total);
+    if (done == total)
+        fputc('\n', stderr);
+}
+
+// Registers the files in the media database, each with a thumbnail of one of its frames
+// (none when the host cannot make one); the thumbnails are made side by side. A failure is
+// reported and changes nothing else.
+void register_media(const std::vector<NewFile> &files)
+{
+    std::vector<const char *> paths, names;
+    for (const NewFile &file : files) {
+        paths.push_back(file.path.c_str());
+        names.push_back(file.name.c_str());
+    }
+    std::vector<char *> thumbs(files.size(), nullptr);
+    bool progress = files.size() > kProgressFrom && isatty(STDERR_FILENO);
+    media_content_create_thumbnails(paths.data(), thumbs.data(), (int)files.size(),
+                                    progress ? show_progress : nullptr, nullptr);
+    int rc = media_content_register_files(paths.data(), MEDIA_CONTENT_TYPE_VIDEO, thumbs.data(),
+                                          names.data(), (int)files.size());
+    for (char *thumb : thumbs)
+        free(thumb);
     if (rc != MEDIA_CONTENT_ERROR_NONE)
-        complain(0, "warning: '%s' is recorded but not in the media database (error %d)",
-                 file.path.c_str(), rc);
+        complain(0, "warning: the files are recorded but not in the media database (error %d)", rc);
 }
 
 int cmd_add(int argc, char **argv)
@@ -352,10 +375,51 @@ int cmd_add(int argc, char **argv)
                             file.path.c_str());
     }
 
-    for (const NewFile &file : files) {
-        register_media(file);
+    register_media(files);
+    for (const NewFile &file : files)
         printf("%d\t%s\n", file.historyid, file.path.c_str());
+    return 0;
+}
+
+// The access token of launch, from --token-file (a file, or '-' for standard input), else
+// --token (with a warning: the command line is public), else ZV_ACCESS_TOKEN; the line end a
+// file or pipe carries is dropped. Returns 0, or the exit status after a line on stderr.
+int read_token(Args &args, std::string *token)
+{
+    if (args.values.count("--token") && args.values.count("--token-file"))
+        return complain(kExitUsage, "launch: give --token or --token-file, not both");
+    if (args.values.count("--token-file")) {
+        const std::string &path = args.values["--token-file"];
+        FILE *f = path == "-" ? stdin : fopen(path.c_str(), "r");
+        if (!f)
+            return complain(kExitUsage, "launch: cannot read the token file '%s': %s", path.c_str(),
+                            strerror(errno));
+        char buf[4096];
+        size_t n;
+        while ((n = fread(buf, 1, sizeof buf, f)) > 0 && token->size() < 65536)
+            token->append(buf, n);
+        bool failed = ferror(f);
+        if (f != stdin)
+            fclose(f);
+        if (failed)
+            return complain(kExitUsage, "launch: cannot read the token file '%s'", path.c_str());
+        while (!token->empty() && (token->back() == '\n' || token->back() == '\r'))
+            token->pop_back();
+        if (token->empty() || token->find_first_of("\r\n") != std::string::npos)
+            return complain(kExitUsage, "launch: the token file '%s' must hold one line",
+                            path.c_str());
+        return 0;
     }
+    if (args.values.count("--token")) {
+        *token = args.values["--token"];
+        if (!token->empty())
+            complain(0, "warning: --token shows the token to every user of this machine; "
+                        "use --token-file or ZV_ACCESS_TOKEN");
+    } else if (const char *env = getenv("ZV_ACCESS_TOKEN")) {
+        *token = env;
+    }
+    if (token->empty())
+        return complain(kExitUsage, "launch: --token-file or ZV_ACCESS_TOKEN is required");
     return 0;
 }
 
@@ -363,14 +427,15 @@ int cmd_launch(int argc, char **argv)
 {
     Args args;
     std::string error;
-    if (!parse_args(argc, argv, 2, {"--token", "--category", "--description", "--tag", "--privacy"},
-                    {"--location"}, &args, &error))
+    if (!parse_args(
+            argc, argv, 2,
+            {"--token", "--token-file", "--category", "--description", "--tag", "--privacy"},
+            {"--location"}, &args, &error))
         return complain(kExitUsage, "launch: %s", error.c_str());
     if (!args.positional.empty())
         return complain(kExitUsage, "launch: unexpected argument '%s'", args.positional[0].c_str());
-    for (const char *required : {"--token", "--category"})
-        if (!args.values.count(required) || args.values[required].empty())
-            return complain(kExitUsage, "launch: %s is required", required);
+    if (!args.values.count("--category") || args.values["--category"].empty())
+        return complain(kExitUsage, "launch: --category is required");
 
     static const std::map<std::string, const char *> kPrivacy = {
         {"public", "0"}, {"unlisted", "1"}, {"private", "2"}};
@@ -382,8 +447,13 @@ int cmd_launch(int argc, char **argv)
         access_type = it->second;
     }
 
+    // Last of the checks, so that a wrong call does not read standard input first.
+    std::string token;
+    if (int rc = read_token(args, &token))
+        return rc;
+
     std::vector<std::pair<const char *, std::string>> extras = {
-        {"ZV_DATA_ACCESS_TOKEN", args.values["--token"]},
+        {"ZV_DATA_ACCESS_TOKEN", token},
         {"ZV_DATA_CATEGORY", args.values["--category"]},
     };
     if (args.values.count("--description"))
@@ -401,6 +471,9 @@ int cmd_launch(int argc, char **argv)
     for (const auto &extra : extras)
         if (rc == APP_CONTROL_ERROR_NONE)
             rc = app_control_add_extra_data(request, extra.first, extra.second.c_str());
+    // A service started from here gets the token in its launch request, not from a copy in
+    // its environment.
+    unsetenv("ZV_ACCESS_TOKEN");
     if (rc == APP_CONTROL_ERROR_NONE)
         rc = app_control_send_launch_request(request, nullptr, nullptr);
     app_control_destroy(request);

@@ -20,6 +20,14 @@
     dlog_print(DLOG_WARN, ZV_LOG_TAG, "%s: %s(%d) > " ZV_LOG_GREEN "[TID:%d] " fmt ZV_LOG_RESET,   \
                __FILE_NAME__, __func__, __LINE__, (int)gettid(), ##__VA_ARGS__)
 
+// The store's own line for a failed statement, then the library's message on a line of its
+// own.
+#define ZV_DB_LOGE_SQL(fmt, rc, db)                                                                \
+    do {                                                                                           \
+        ZV_LOGE(fmt, rc);                                                                          \
+        log_library_message(db);                                                                   \
+    } while (0)
+
 namespace
 {
 
@@ -66,9 +74,12 @@ struct GFree {
     void operator()(gchar *p) const { g_free(p); }
 };
 
-// The module's state: the connection, NULL while closed.
+// The module's state: the connection, NULL while closed, and the update statement, prepared
+// once per connection (the service updates a row for every progress report). The statement
+// is declared after the connection, so it is finalized first.
 struct StoreState {
     DbPtr db;
+    StmtPtr update;
 };
 
 StoreState g_store;
@@ -108,14 +119,22 @@ GStringPtr build_statement(const char *fmt, ...)
     return sql;
 }
 
-// Prepares sql on db; on failure logs "SQL error" with the library's message and returns NULL.
-StmtPtr prepare(sqlite3 *db, const char *sql)
+// The library's message about the last failure on db, on a line of its own: it follows the
+// store's own line ("SQL error: %d", ...), which stays whole.
+void log_library_message(sqlite3 *db)
+{
+    ZV_LOGE("sqlite: %s", db ? sqlite3_errmsg(db) : "no connection");
+}
+
+// Prepares sql on db; on failure logs "SQL error" and the library's message and returns NULL.
+StmtPtr prepare(sqlite3 *db, const char *sql, unsigned int flags = 0)
 {
     sqlite3_stmt *raw = nullptr;
-    int rc = sqlite3_prepare_v2(db, sql, -1, &raw, nullptr);
+    int rc = sqlite3_prepare_v3(db, sql, -1, flags, &raw, nullptr);
     StmtPtr stmt(raw);
     if (rc != SQLITE_OK) {
-        ZV_LOGE("SQL error: %d (%s)", rc, sqlite3_errmsg(db));
+        ZV_LOGE("SQL error: %d", rc);
+        log_library_message(db);
         return nullptr;
     }
     return stmt;
@@ -125,8 +144,10 @@ StmtPtr prepare(sqlite3 *db, const char *sql)
 void finalize(StmtPtr &stmt)
 {
     sqlite3 *db = sqlite3_db_handle(stmt.get());
-    if (sqlite3_finalize(stmt.release()) != SQLITE_OK)
-        ZV_LOGE("sqlite3_finalize is failed. (%s)", sqlite3_errmsg(db));
+    if (sqlite3_finalize(stmt.release()) != SQLITE_OK) {
+        ZV_LOGE("sqlite3_finalize is failed.");
+        log_library_message(db);
+    }
 }
 
 bool step_succeeded(int rc)
@@ -136,21 +157,27 @@ bool step_succeeded(int rc)
 
 void bind_int(sqlite3_stmt *stmt, int index, int value)
 {
-    if (sqlite3_bind_int(stmt, index, value) != SQLITE_OK)
-        ZV_LOGE("sqlite3_bind_int is failed. (%s)", sqlite3_errmsg(sqlite3_db_handle(stmt)));
+    if (sqlite3_bind_int(stmt, index, value) != SQLITE_OK) {
+        ZV_LOGE("sqlite3_bind_int is failed.");
+        log_library_message(sqlite3_db_handle(stmt));
+    }
 }
 
 // The text is not copied: it must live until the statement has been stepped.
 void bind_text(sqlite3_stmt *stmt, int index, const char *value)
 {
-    if (sqlite3_bind_text(stmt, index, value, -1, SQLITE_STATIC) != SQLITE_OK)
-        ZV_LOGE("sqlite3_bind_text is failed. (%s)", sqlite3_errmsg(sqlite3_db_handle(stmt)));
+    if (sqlite3_bind_text(stmt, index, value, -1, SQLITE_STATIC) != SQLITE_OK) {
+        ZV_LOGE("sqlite3_bind_text is failed.");
+        log_library_message(sqlite3_db_handle(stmt));
+    }
 }
 
 void bind_double(sqlite3_stmt *stmt, int index, double value)
 {
-    if (sqlite3_bind_double(stmt, index, value) != SQLITE_OK)
-        ZV_LOGE("sqlite3_bind_double is failed. (%s)", sqlite3_errmsg(sqlite3_db_handle(stmt)));
+    if (sqlite3_bind_double(stmt, index, value) != SQLITE_OK) {
+        ZV_LOGE("sqlite3_bind_double is failed.");
+        log_library_message(sqlite3_db_handle(stmt));
+    }
 }
 
 char *column_text_copy(sqlite3_stmt *stmt, int column)
@@ -178,7 +205,7 @@ void tune_connection(sqlite3 *db)
         if (StmtPtr stmt = prepare(db, sql)) {
             int rc = sqlite3_step(stmt.get());
             if (!step_succeeded(rc))
-                ZV_LOGE("SQL error: %d (%s)", rc, sqlite3_errmsg(db));
+                ZV_DB_LOGE_SQL("SQL error: %d", rc, db);
             finalize(stmt);
         }
     }
@@ -238,7 +265,7 @@ int step_count(sqlite3 *db, const char *sql)
         ZV_LOGI("SQL step success");
         count = sqlite3_column_int(stmt.get(), 0);
     } else {
-        ZV_LOGE("SQL return: %d (%s)", rc, sqlite3_errmsg(db));
+        ZV_DB_LOGE_SQL("SQL return: %d", rc, db);
     }
     finalize(stmt);
     return count;
@@ -307,7 +334,7 @@ static int _zv_ext_db_delete_all_item(sqlite3 *db)
     int rc = sqlite3_step(stmt.get());
     bool ok = step_succeeded(rc);
     if (!ok)
-        ZV_LOGE("SQL error: %d (%s)", rc, sqlite3_errmsg(db));
+        ZV_DB_LOGE_SQL("SQL error: %d", rc, db);
     finalize(stmt);
     return ok ? 1 : 0;
 }
@@ -344,7 +371,7 @@ int zv_ext_db_open(void)
         return 0;
     rc = sqlite3_step(stmt.get());
     if (rc != SQLITE_DONE && rc != SQLITE_OK) {
-        ZV_LOGE("SQL error: %d (%s)", rc, sqlite3_errmsg(db.get()));
+        ZV_DB_LOGE_SQL("SQL error: %d", rc, db.get());
         finalize(stmt);
         return 0;
     }
@@ -352,7 +379,8 @@ int zv_ext_db_open(void)
 
     rc = sqlite3_busy_handler(db.get(), _zv_ext_db_busyhandler, nullptr);
     if (rc != SQLITE_OK) {
-        ZV_LOGE("Fail to register busy handler. ret = %d (%s)", rc, sqlite3_errmsg(db.get()));
+        ZV_LOGE("Fail to register busy handler. ret = %d", rc);
+        log_library_message(db.get());
         return 0;
     }
     tune_connection(db.get());
@@ -364,6 +392,7 @@ int zv_ext_db_open(void)
 void zv_ext_db_close(void)
 {
     ZV_LOG_ENTER();
+    g_store.update.reset();
     g_store.db.reset();
 }
 
@@ -402,7 +431,7 @@ int zv_ext_db_insert_item(DbItem *item)
     if (step_succeeded(rc))
         ZV_LOGI("SQL step success");
     else
-        ZV_LOGE("SQL return: %d (%s)", rc, sqlite3_errmsg(db));
+        ZV_DB_LOGE_SQL("SQL return: %d", rc, db);
     finalize(stmt);
     return 1;
 }
@@ -422,7 +451,7 @@ int zv_ext_db_delete_item(int historyid)
     if (ok)
         ZV_LOGI("SQL step success");
     else
-        ZV_LOGE("SQL error: %d (%s)", rc, sqlite3_errmsg(db));
+        ZV_DB_LOGE_SQL("SQL error: %d", rc, db);
     finalize(stmt);
     return ok ? 1 : 0;
 }
@@ -437,13 +466,12 @@ int zv_ext_db_update_item(DbItem *item)
     sqlite3 *db = connection();
     if (!db)
         return 0;
-    GStringPtr sql = build_statement("%s", kUpdateSql);
-    if (!sql)
-        return 0;
-    StmtPtr stmt = prepare(db, sql->str);
-    if (!stmt)
-        return 0;
-    sqlite3_stmt *s = stmt.get();
+    if (!g_store.update) {
+        g_store.update = prepare(db, kUpdateSql, SQLITE_PREPARE_PERSISTENT);
+        if (!g_store.update)
+            return 0;
+    }
+    sqlite3_stmt *s = g_store.update.get();
     bind_int(s, 1, item->percent);
     bind_int(s, 2, item->status);
     // Left unbound, the url parameter is NULL and clears the column.
@@ -454,8 +482,10 @@ int zv_ext_db_update_item(DbItem *item)
     int rc = sqlite3_step(s);
     const bool stored = step_succeeded(rc);
     if (!stored)
-        ZV_LOGE("SQL return: %d (%s)", rc, sqlite3_errmsg(db));
-    finalize(stmt);
+        ZV_DB_LOGE_SQL("SQL return: %d", rc, db);
+    // Ready for the next update: no lock or text of this one is kept.
+    sqlite3_reset(s);
+    sqlite3_clear_bindings(s);
     // A step that failed (history locked past the busy handler, disk full) is reported, so
     // that the caller can store the row again later.
     return stored ? 1 : 0;

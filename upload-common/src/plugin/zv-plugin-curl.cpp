@@ -408,7 +408,14 @@ size_t _zv_curl_read_cb(char *ptr, size_t size, size_t nmemb, void *userp)
     }
     if (fseeko(item->file_stream, item->file_offset, SEEK_SET) != 0)
         ZV_LOGE("fseek fail");
-    size_t n = fread(ptr, 1, size * nmemb, item->file_stream);
+    // Never past the size the request announced (libcurl reads until a read gives 0): a file
+    // that grew meanwhile sends no byte beyond its Content-Length.
+    size_t want = size * nmemb;
+    if (item->file_offset >= item->file_size)
+        want = 0;
+    else if (want > static_cast<size_t>(item->file_size - item->file_offset))
+        want = static_cast<size_t>(item->file_size - item->file_offset);
+    size_t n = want ? fread(ptr, 1, want, item->file_stream) : 0;
     item->file_offset += static_cast<int>(n);
     if (item->progress_cb_func) {
         int percent = 100;
@@ -637,20 +644,35 @@ CURL *build_easy_handle(TransferItem *item, SlistPtr *headers)
         return NULL;
     CURL *c = curl.get();
 
+    auto append = [headers](const char *line) {
+        curl_slist *next = curl_slist_append(headers->get(), line);
+        if (!next)
+            return false;
+        headers->release();
+        headers->reset(next);
+        return true;
+    };
     for (GList *l = item->header_list; l; l = l->next) {
-        curl_slist *next = curl_slist_append(headers->get(), static_cast<char *>(l->data));
-        if (!next)
+        if (!append(static_cast<char *>(l->data)))
             return NULL;
-        headers->release();
-        headers->reset(next);
     }
-    // The data PUT is framed by its Content-Length line alone: no expect-continue round.
-    if (item->method == ZV_CURL_HTTP_METHOD_PUT && !has_header(item->header_list, "Expect")) {
-        curl_slist *next = curl_slist_append(headers->get(), "Expect:");
-        if (!next)
-            return NULL;
-        headers->release();
-        headers->reset(next);
+    // The data PUT is framed by its Content-Length line alone. libcurl is not told the body's
+    // size, so that it reads the file until a read gives 0 bytes (that last read reports
+    // progress too); the empty lines keep it from sending the body chunked and from an
+    // expect-continue round. A caller that gave no length gets the file's rest.
+    if (item->method == ZV_CURL_HTTP_METHOD_PUT) {
+        for (const char *name : {"Transfer-Encoding", "Expect"}) {
+            std::string empty = std::string(name) + ":";
+            if (!has_header(item->header_list, name) && !append(empty.c_str()))
+                return NULL;
+        }
+        if (!has_header(item->header_list, "Content-Length")) {
+            long long length = 0;
+            if (item->file_path && item->file_size > item->file_offset)
+                length = static_cast<long long>(item->file_size) - item->file_offset;
+            if (!append(("Content-Length: " + std::to_string(length)).c_str()))
+                return NULL;
+        }
     }
 
     switch (item->method) {
@@ -703,12 +725,10 @@ CURL *build_easy_handle(TransferItem *item, SlistPtr *headers)
     curl_easy_setopt(c, CURLOPT_DEBUGDATA,
                      reinterpret_cast<void *>(static_cast<intptr_t>(item->method)));
     if (item->method == ZV_CURL_HTTP_METHOD_PUT) {
-        // The body's length is known: libcurl frames it with Content-Length, never chunked.
-        curl_off_t length = 0;
-        if (item->file_path && item->file_size > item->file_offset)
-            length = static_cast<curl_off_t>(item->file_size) - item->file_offset;
-        curl_easy_setopt(c, CURLOPT_INFILESIZE_LARGE, length);
         curl_easy_setopt(c, CURLOPT_UPLOAD_BUFFERSIZE, kUploadBufferSize);
+        // A PUT without a file (the status query) has no body to read at all.
+        if (!item->file_path)
+            curl_easy_setopt(c, CURLOPT_INFILESIZE_LARGE, static_cast<curl_off_t>(0));
     }
     return curl.release();
 }
