@@ -4,8 +4,11 @@
 // host points at a closed local port, so nothing leaves the machine.
 #include "zv-upload-ctrl.h"
 
+#include <arpa/inet.h>
 #include <fcntl.h>
 #include <gtest/gtest.h>
+#include <netinet/in.h>
+#include <sys/socket.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
@@ -230,6 +233,44 @@ TEST_F(UploadCtrlTest, RowsThatCannotBeSentEndPausedAndSayWhy)
         EXPECT_EQ(job(id)->handle, nullptr) << "no request was made for " << id;
     EXPECT_NE(job(3)->handle, nullptr);
     EXPECT_NE(job(7)->handle, nullptr);
+}
+
+TEST_F(UploadCtrlTest, StatusAnswerNamingNoByteOfTheFilePausesWithoutDataUpload)
+{
+    // A server that takes the status queries and never answers: only the answers below arrive.
+    int silent = socket(AF_INET, SOCK_STREAM | SOCK_CLOEXEC, 0);
+    sockaddr_in addr{};
+    addr.sin_family = AF_INET;
+    addr.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
+    socklen_t len = sizeof addr;
+    ASSERT_EQ(bind(silent, reinterpret_cast<sockaddr *>(&addr), len), 0);
+    ASSERT_EQ(listen(silent, 8), 0);
+    ASSERT_EQ(getsockname(silent, reinterpret_cast<sockaddr *>(&addr), &len), 0);
+    std::string url = "http://127.0.0.1:" + std::to_string(ntohs(addr.sin_port)) + "/up";
+    std::string clip = video("clip.mp4", 100); // last byte index 99
+    const char *ranges[] = {"100", "5000000000", "-1", "12abc", "99999999999999999999"};
+    for (int id = 1; id <= 5; id++)
+        ASSERT_TRUE(add_row(id, ZV_UPLOAD_STATUS_PAUSED, id, clip.c_str(), "Clip", url.c_str()));
+    start();
+    for (int id = 1; id <= 5; id++) {
+        ad_.resume_upload(&ad_, job(id));
+        ServiceResponse resp = {job(id)->handle, 308, ZV_RESP_TYPE_UPLOAD_QUERY,
+                                const_cast<char *>(ranges[id - 1])};
+        _zv_upload_ctrl_resp_cb(ZV_ERROR_NONE, &resp, &ad_);
+    }
+    ASSERT_TRUE(zv_upload_test::run_until([&] {
+        for (int id = 1; id <= 5; id++)
+            if (job(id)->status != ZV_UPLOAD_STATUS_PAUSED)
+                return false;
+        return true;
+    }));
+    for (int id = 1; id <= 5; id++) {
+        EXPECT_TRUE(g_log.logged("Range of " + std::to_string(id) + " names no byte of its file " +
+                                 "(100 bytes): \"" + ranges[id - 1] + "\""));
+        EXPECT_EQ(stored_rows()[id].status, ZV_UPLOAD_STATUS_PAUSED);
+        EXPECT_EQ(job(id)->handle->resp_type, ZV_RESP_TYPE_UPLOAD_QUERY) << "no data upload";
+    }
+    close(silent);
 }
 
 TEST_F(UploadCtrlTest, CompletedJobsIgnorePauseAndResume)
