@@ -126,7 +126,7 @@ inline void on_answer(int, TransferResponse *resp, void *user_data)
     w->cv.notify_all();
 }
 
-inline void on_progress(int, void *user_data, int, int)
+inline void on_progress(int, void *user_data, int64_t, int64_t)
 {
     static_cast<Waiter *>(user_data)->reads++;
 }
@@ -144,7 +144,8 @@ inline TransferItem *new_item(Waiter *w, int method, const std::string &url)
     return item;
 }
 
-inline TransferItem *new_upload(Waiter *w, const std::string &url, const std::string &path, int size)
+inline TransferItem *new_upload(Waiter *w, const std::string &url, const std::string &path,
+                                int64_t size)
 {
     TransferItem *item = new_item(w, ZV_CURL_HTTP_METHOD_PUT, url);
     std::string range =
@@ -209,7 +210,7 @@ struct RunResult {
     bool ok = false;
 };
 
-inline RunResult engine_upload(Target &target, const std::string &path, int size,
+inline RunResult engine_upload(Target &target, const std::string &path, int64_t size,
                                long *peak_rss_growth)
 {
     RunResult r;
@@ -230,6 +231,31 @@ inline RunResult engine_upload(Target &target, const std::string &path, int size
     if (peak_rss_growth)
         *peak_rss_growth = std::max(*peak_rss_growth, peak - base_rss);
     zv_curl_delete(&item);
+    return r;
+}
+
+// The same file with `curl -T` to a new upload address: its wall time and CPU.
+inline RunResult curl_upload(Target &target, const std::string &path)
+{
+    RunResult r;
+    std::string url = target.upload_url();
+    if (url.empty())
+        return r;
+    auto t0 = Clock::now();
+    pid_t pid = fork();
+    if (pid == 0) {
+        int null_fd = open("/dev/null", O_WRONLY);
+        dup2(null_fd, STDOUT_FILENO);
+        execlp("curl", "curl", "-sS", "-o", "/dev/null", "-T", path.c_str(), url.c_str(),
+               (char *)nullptr);
+        _exit(127);
+    }
+    int status = 0;
+    rusage ru{};
+    wait4(pid, &status, 0, &ru);
+    r.wall = seconds_since(t0);
+    r.cpu = cpu_seconds(ru);
+    r.ok = WIFEXITED(status) && WEXITSTATUS(status) == 0;
     return r;
 }
 

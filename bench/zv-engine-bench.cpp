@@ -108,30 +108,6 @@ int run_sink()
     }
 }
 
-RunResult curl_upload(Target &target, const std::string &path)
-{
-    RunResult r;
-    std::string url = target.upload_url();
-    if (url.empty())
-        return r;
-    auto t0 = Clock::now();
-    pid_t pid = fork();
-    if (pid == 0) {
-        int null_fd = open("/dev/null", O_WRONLY);
-        dup2(null_fd, STDOUT_FILENO);
-        execlp("curl", "curl", "-sS", "-o", "/dev/null", "-T", path.c_str(), url.c_str(),
-               (char *)nullptr);
-        _exit(127);
-    }
-    int status = 0;
-    rusage ru{};
-    wait4(pid, &status, 0, &ru);
-    r.wall = seconds_since(t0);
-    r.cpu = cpu_seconds(ru);
-    r.ok = WIFEXITED(status) && WEXITSTATUS(status) == 0;
-    return r;
-}
-
 // A listener of this process that notes when the first byte of a connection arrives.
 class FirstByteProbe
 {

@@ -1,6 +1,8 @@
 #!/usr/bin/env bash
 # Builds and runs the benchmarks, printing each figure with its target: the transfer engine
-# (zv-engine-bench) and the whole service (zv-service-bench).
+# (zv-engine-bench) and the whole service (zv-service-bench), whose figures include a video
+# of 2 GiB + 64 MiB next to curl and the service's peak memory for it (the videos are written
+# to /tmp, about 2.2 GiB, and removed at the end).
 # ZV_BENCH_BUILD: the build folder (default build/). Arguments go to zv-engine-bench
 # (--size-mib N, --rounds N, --requests N); ZV_SERVICE_BENCH_ARGS to zv-service-bench
 # (--size-mib N, --jobs N, --job-mib N, --rows N). The engine's server is zuvo-devserver when

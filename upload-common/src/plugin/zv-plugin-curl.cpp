@@ -686,9 +686,8 @@ CURL *build_easy_handle(TransferItem *item, SlistPtr *headers)
         curl_easy_setopt(c, CURLOPT_POSTFIELDSIZE, static_cast<long>(item->body_len));
         curl_easy_setopt(c, CURLOPT_COPYPOSTFIELDS, item->body);
     } else if (item->method == ZV_CURL_HTTP_METHOD_POST) {
-        // No body: only its length 0 is given, so that libcurl frames the POST with
-        // "Content-Length: 0" instead of a chunked body behind an expect-continue round.
-        // Whatever it reads comes from the read callback, which has no file to read here.
+        // No body option, only its length, 0: libcurl then frames the POST with
+        // "Content-Length: 0" rather than as a chunked upload from the read callback.
         curl_easy_setopt(c, CURLOPT_POSTFIELDSIZE, 0L);
     }
     curl_easy_setopt(c, CURLOPT_WRITEFUNCTION, _zv_curl_write_cb);
