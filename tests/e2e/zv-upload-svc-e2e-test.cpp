@@ -400,6 +400,8 @@ TEST_P(ServiceFailureTest, RowEndsAsExpectedWithItsMessage)
 const FailureCase kFailures[] = {
     {"Http500OnDataUpload", "kind=data,action=status,status=500", true, true, true,
      ZV_UPLOAD_STATUS_PAUSED, "HTTP RESULT : 500", nullptr, false},
+    {"ContentRangeRefused", "kind=data,action=status,status=416", true, true, true,
+     ZV_UPLOAD_STATUS_PAUSED, "HTTP RESULT : 416", nullptr, false},
     {"MetadataAnswerWithoutLocation", "kind=meta,action=nolocation", true, true, true,
      ZV_UPLOAD_STATUS_PAUSED, "META UPLOAD FAIL : Clip", nullptr, false},
     {"MissingApiKey", nullptr, false, true, true, ZV_UPLOAD_STATUS_PAUSED,
