@@ -10,9 +10,9 @@
 
 #include <filesystem>
 #include <fstream>
-#include <random>
 #include <map>
 #include <memory>
+#include <random>
 #include <string>
 #include <vector>
 
@@ -307,8 +307,8 @@ TEST_F(LargeFileE2ETest, VideoPastTwoGiBSurvivesAKillAndArrivesWhole)
     int id = zv_e2e::record({file}, "Long").at(0);
     Child &first = start_service();
     std::string copy;
-    ASSERT_TRUE(zv_test::wait_for(
-        [&] { return !(copy = upload_of(id).path).empty(); }, kLongWaitMs));
+    ASSERT_TRUE(
+        zv_test::wait_for([&] { return !(copy = upload_of(id).path).empty(); }, kLongWaitMs));
     struct stat st = {};
     ASSERT_TRUE(zv_test::wait_for(
         [&] { return stat(copy.c_str(), &st) == 0 && st.st_size > kTwoGiB; }, 4 * kLongWaitMs));

@@ -501,8 +501,7 @@ TEST_F(EngineTest, PutPastFourGiBCountsOffsetsAndPercentInSixtyFourBits)
 
     std::string raw = server.requests().back();
     size_t head_end = raw.find("\r\n\r\n") + 4;
-    EXPECT_NE(raw.find("Content-Range: bytes 5367660544-5368709119/5368709120"),
-              std::string::npos);
+    EXPECT_NE(raw.find("Content-Range: bytes 5367660544-5368709119/5368709120"), std::string::npos);
     EXPECT_EQ(raw.substr(head_end), tail);
     std::lock_guard<std::mutex> lock(o.m);
     ASSERT_FALSE(o.progress.empty());

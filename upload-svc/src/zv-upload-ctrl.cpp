@@ -46,8 +46,8 @@ struct WorkerView {
     const ServiceRequest *handle = nullptr; // the job's request in flight
     int status = 0;
     int percent = 0;
-    int64_t offset = 0;     // 64-bit, as the job's: videos pass 2 GiB
-    int64_t filesize = -1;  // of the job's file when its request was made; -1: unknown
+    int64_t offset = 0;    // 64-bit, as the job's: videos pass 2 GiB
+    int64_t filesize = -1; // of the job's file when its request was made; -1: unknown
     bool has_url = false;
     std::string url;
     std::string title;

@@ -994,8 +994,7 @@ int zv_curl_set_header(TransferItem *item, const char *header)
     return ZV_CURL_ERROR_NONE;
 }
 
-int zv_curl_set_file_info(TransferItem *item, const char *file_path, int64_t size,
-                          int64_t offset)
+int zv_curl_set_file_info(TransferItem *item, const char *file_path, int64_t size, int64_t offset)
 {
     ZV_CURL_CHECK_ITEM(item);
     if (!file_path) {

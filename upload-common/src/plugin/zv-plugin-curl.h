@@ -81,14 +81,14 @@ struct TransferItem {
     int method;      // ZvCurlHttpMethod; any value but POST and PUT sends a GET
     char *url;
     char *body; // sent as the POST fields when body_len is above 0
-    int body_len; // at most the length of body
+    int body_len;        // at most the length of body
     GList *header_list;  // char* lines such as "Name: value"; "Name:" removes that header
     int timeout;         // whole request, ms; 0 keeps the library default
     int connect_timeout; // connection phase, ms; 0 keeps the library default
     char *user_agent;
     FILE *file_stream; // the upload file, opened by the first read
     char *file_path;   // the file whose bytes are the body of a PUT
-    int64_t file_size;      // 64-bit: videos pass 2 GiB
+    int64_t file_size; // 64-bit: videos pass 2 GiB
     int64_t file_offset;    // next byte of the file to send; advanced by every read
     GList *write_data_list; // TransferChunk*: the response body as it arrived
     int write_data_len;
@@ -148,6 +148,5 @@ int zv_curl_set_connect_timeout(TransferItem *item, int timeout_ms);
 int zv_curl_set_user_agent(TransferItem *item, const char *user_agent); // NULL clears
 int zv_curl_set_header(TransferItem *item, const char *header);         // appended
 // A negative size or offset is refused with 4.
-int zv_curl_set_file_info(TransferItem *item, const char *file_path, int64_t size,
-                          int64_t offset);
+int zv_curl_set_file_info(TransferItem *item, const char *file_path, int64_t size, int64_t offset);
 int zv_curl_set_netwrok_info(TransferItem *item, const char *ip, const char *proxy);
