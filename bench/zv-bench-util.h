@@ -126,7 +126,7 @@ inline void on_answer(int, TransferResponse *resp, void *user_data)
     w->cv.notify_all();
 }
 
-inline void on_progress(int, void *user_data, int, int)
+inline void on_progress(int, void *user_data, int64_t, int64_t)
 {
     static_cast<Waiter *>(user_data)->reads++;
 }
@@ -144,7 +144,8 @@ inline TransferItem *new_item(Waiter *w, int method, const std::string &url)
     return item;
 }
 
-inline TransferItem *new_upload(Waiter *w, const std::string &url, const std::string &path, int size)
+inline TransferItem *new_upload(Waiter *w, const std::string &url, const std::string &path,
+                                int64_t size)
 {
     TransferItem *item = new_item(w, ZV_CURL_HTTP_METHOD_PUT, url);
     std::string range =
@@ -209,7 +210,7 @@ struct RunResult {
     bool ok = false;
 };
 
-inline RunResult engine_upload(Target &target, const std::string &path, int size,
+inline RunResult engine_upload(Target &target, const std::string &path, int64_t size,
                                long *peak_rss_growth)
 {
     RunResult r;

@@ -1,8 +1,10 @@
 // Benchmark of the whole upload service, the real processes on loopback:
 //   1. a large upload through the service in the foreground (every progress report stored)
 //      next to the engine alone and to `curl -T` uploading the same file in the same run;
-//   2. many jobs at once: time, the service's peak memory, byte-identical copies;
-//   3. start-up with a long history (thumbnails included) to the first drawn job list.
+//   2. a video past 2 GiB (2 GiB + 64 MiB) through the service next to curl for the same
+//      file, and the service's peak memory, which must not grow with the file's size;
+//   3. many jobs at once: time, the service's peak memory, byte-identical copies;
+//   4. start-up with a long history (thumbnails included) to the first drawn job list.
 // Prints each figure with its target.
 //
 //   zv-service-bench [--bin DIR] [--size-mib N] [--jobs N] [--job-mib N] [--rows N]
@@ -184,6 +186,19 @@ struct World {
         }
     }
 
+    // The service without a batch, once it listens and has drawn its first frames: as when
+    // the companion hands a batch to the running instance. False when it never listened.
+    bool start_idle_service()
+    {
+        start_service(false);
+        std::string socket = dir + "/run/zuvo-upload-svc.sock";
+        auto t0 = Clock::now();
+        while (access(socket.c_str(), F_OK) != 0 && seconds_since(t0) < 30)
+            std::this_thread::sleep_for(std::chrono::milliseconds(20));
+        std::this_thread::sleep_for(std::chrono::seconds(1)); // its first frames drawn
+        return access(socket.c_str(), F_OK) == 0;
+    }
+
     // The service's peak resident memory so far, in KiB.
     long service_peak_kib() const
     {
@@ -322,12 +337,7 @@ bool bench_large_upload(const std::string &root, int size_mib)
         // The service is up before the file is recorded, as when the companion hands a
         // batch to the running instance: its start-up is measured on its own below.
         auto service = [&] {
-            world.start_service(false);
-            std::string socket = world.dir + "/run/zuvo-upload-svc.sock";
-            auto t0 = Clock::now();
-            while (access(socket.c_str(), F_OK) != 0 && seconds_since(t0) < 30)
-                std::this_thread::sleep_for(std::chrono::milliseconds(20));
-            std::this_thread::sleep_for(std::chrono::seconds(1)); // its first frames drawn
+            world.start_idle_service();
             if (!world.record({path}) || !world.launch())
                 return -1.0;
             bool done = wait_all_completed(1, 600, Clock::now(), world) >= 0;
@@ -375,6 +385,55 @@ bool bench_large_upload(const std::string &root, int size_mib)
                mib / median(curl_s), against_curl),
            "<= 1.10x", curl_pass);
     return pass && curl_pass;
+}
+
+// One running service uploads a video of 64 MiB, then one of 2 GiB + 64 MiB; curl sends the
+// large one to the same server. The service's time is the server's, from the metadata
+// answer to the data answer; its peak memory after the large video must stay where the
+// small one left it.
+bool bench_video_past_2gib(const std::string &root)
+{
+    const long long small_size = 64LL << 20, size = (2048LL + 64) << 20;
+    std::string small = root + "/video-64m.mp4", large = root + "/video-2g64m.mp4";
+    if (!make_file(small, small_size, 2) || !make_file(large, size, 3)) {
+        fprintf(stderr, "cannot write the videos in %s\n", root.c_str());
+        return false;
+    }
+    World world;
+    if (!world.open(root, "past-2gib", false) || !world.start_idle_service())
+        return false;
+    long peak_small = 0, peak_large = 0;
+    auto upload = [&](const std::string &file, int completed, long *peak) {
+        return world.record({file}) && world.launch() &&
+               wait_all_completed(completed, 900, Clock::now(), world, peak) >= 0;
+    };
+    bool ok = upload(small, 1, &peak_small) && upload(large, 2, &peak_large);
+    double service_s = ok ? last_upload_seconds(world) : -1;
+    pid_t server = world.server;
+    world.server = -1; // the server stays for curl's turn
+    world.close();
+    world.server = server;
+    RunResult c = curl_upload(world.target, large);
+    unlink(small.c_str());
+    unlink(large.c_str());
+    if (service_s <= 0 || !c.ok) {
+        fprintf(stderr, "the upload past 2 GiB failed (service %.2f s, curl %d)\n", service_s,
+                c.ok);
+        return false;
+    }
+    const double mib = static_cast<double>(size >> 20), ratio = service_s / c.wall;
+    bool time_pass = ratio <= 1.25;
+    report("upload past 2 GiB vs curl",
+           fmt("%.0f MiB: service %.2f s, curl %.2f s", mib, service_s, c.wall) +
+               fmt(": %.2fx", ratio),
+           "<= 1.25x", time_pass);
+    const double growth = (peak_large - peak_small) / 1024.0;
+    bool rss_pass = growth < 4.0;
+    report("service peak memory past 2 GiB",
+           fmt("%.1f MiB after 64 MiB, %.1f MiB after %.0f MiB", peak_small / 1024.0,
+               peak_large / 1024.0, mib),
+           "growth < 4 MiB", rss_pass);
+    return time_pass && rss_pass;
 }
 
 bool bench_many_jobs(const std::string &root, int jobs, int job_mib)
@@ -560,6 +619,7 @@ int main(int argc, char **argv)
     setenv("ZV_DLOG_FILE", "/dev/null", 1);
     zv_curl_init_service();
     bool all = bench_large_upload(root, size_mib);
+    all &= bench_video_past_2gib(root);
     zv_curl_finalize_service();
     all &= bench_many_jobs(root, jobs, job_mib);
     all &= bench_startup(root, rows);

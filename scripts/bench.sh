@@ -1,8 +1,10 @@
 #!/usr/bin/env bash
 # Builds and runs the benchmarks, printing each figure with its target: the transfer engine
 # (zv-engine-bench) against zuvo-devserver and against the benchmark's own sink server, quiet
-# and under load; the whole service (zv-service-bench); and the companion recording many
-# videos with their thumbnails.
+# and under load; the whole service (zv-service-bench), whose figures include a video of
+# 2 GiB + 64 MiB next to curl and the service's peak memory for it (the videos are written to
+# /tmp, about 2.2 GiB, and removed at the end); and the companion recording many videos with
+# their thumbnails.
 # ZV_BENCH_BUILD: the build folder (default build/). Arguments go to zv-engine-bench
 # (--size-mib N, --rounds N, --requests N); ZV_SERVICE_BENCH_ARGS to zv-service-bench
 # (--size-mib N, --jobs N, --job-mib N, --rows N); ZV_COMPANION_BENCH_FILES the numbers of

@@ -1,14 +1,18 @@
 // End-to-end tests of the service process: the real zuvo-upload-svc (headless) uploads the
 // rows the companion client records to the development server, is killed or terminated in
 // the middle, is launched again, and meets the failures of the server and of its settings.
+#include <fcntl.h>
 #include <gtest/gtest.h>
 #include <signal.h>
 #include <sys/stat.h>
+#include <sys/statvfs.h>
 #include <sys/wait.h>
 
 #include <filesystem>
+#include <fstream>
 #include <map>
 #include <memory>
+#include <random>
 #include <string>
 #include <vector>
 
@@ -250,6 +254,93 @@ TEST_F(ServiceE2ETest, SecondLaunchAddsNewRowsWhileUploadsRun)
     EXPECT_EQ(data_requests, 1) << "the running upload went on undisturbed";
 }
 
+// A video past 2 GiB, the whole road: the companion records it, the service is killed once the
+// server holds more than 2 GiB, and the next start sends the rest. Its own name keeps it out
+// of the sanitizer stages, whose builds would take minutes over its bytes.
+class LargeFileE2ETest : public ServiceE2ETest
+{
+};
+
+// Whether two files hold the same bytes.
+bool same_bytes(const std::string &a, const std::string &b)
+{
+    std::ifstream fa(a, std::ios::binary), fb(b, std::ios::binary);
+    std::vector<char> ba(8 << 20), bb(8 << 20);
+    while (fa && fb) {
+        fa.read(ba.data(), ba.size());
+        fb.read(bb.data(), bb.size());
+        if (fa.gcount() != fb.gcount() || memcmp(ba.data(), bb.data(), fa.gcount()) != 0)
+            return false;
+    }
+    return fa.eof() && fb.eof();
+}
+
+TEST_F(LargeFileE2ETest, VideoPastTwoGiBSurvivesAKillAndArrivesWhole)
+{
+#if defined(__SANITIZE_ADDRESS__) || defined(__SANITIZE_THREAD__)
+    GTEST_SKIP() << "runs in plain builds only";
+#endif
+    constexpr int64_t kTwoGiB = 2LL << 30, kSize = kTwoGiB + (64LL << 20);
+    struct statvfs fs;
+    if (statvfs(dir_.path().c_str(), &fs) == 0 &&
+        static_cast<int64_t>(fs.f_bavail) * static_cast<int64_t>(fs.f_frsize) < (5LL << 30)) {
+        std::string why = "less than 5 GiB free for the server's copy in " + dir_.path();
+        const auto *test = ::testing::UnitTest::GetInstance()->current_test_info();
+        if (const char *report = getenv("ZV_REPORT_DIR"))
+            std::ofstream(std::string(report) + "/skipped.txt", std::ios::app)
+                << test->test_suite_name() << "." << test->name() << " skipped: " << why << "\n";
+        GTEST_SKIP() << why;
+    }
+    // Sparse, with generated MiBs at the start, across 2 GiB and at the end.
+    std::string file = dir_.file("long.mp4");
+    int fd = open(file.c_str(), O_CREAT | O_WRONLY, 0600);
+    ASSERT_GE(fd, 0);
+    ASSERT_EQ(ftruncate(fd, kSize), 0);
+    std::mt19937 gen(17);
+    std::string block(1 << 20, '\0');
+    for (int64_t at : {int64_t(0), kTwoGiB - (1 << 19), kSize - (1 << 20)}) {
+        for (char &c : block)
+            c = static_cast<char>(gen());
+        ASSERT_EQ(pwrite(fd, block.data(), block.size(), at), static_cast<ssize_t>(block.size()));
+    }
+    close(fd);
+
+    // The first data upload is read slowly enough to catch the server past 2 GiB.
+    ASSERT_TRUE(start_server({"kind=data,action=throttle,rate=134217728"}));
+    int id = zv_e2e::record({file}, "Long").at(0);
+    Child &first = start_service();
+    std::string copy;
+    ASSERT_TRUE(
+        zv_test::wait_for([&] { return !(copy = upload_of(id).path).empty(); }, kLongWaitMs));
+    struct stat st = {};
+    ASSERT_TRUE(zv_test::wait_for(
+        [&] { return stat(copy.c_str(), &st) == 0 && st.st_size > kTwoGiB; }, 4 * kLongWaitMs));
+    first.signal(SIGKILL);
+    ASSERT_TRUE(first.wait_exit(kLongWaitMs));
+    ASSERT_LT(stat(copy.c_str(), &st) == 0 ? st.st_size : kSize, kSize) << "killed too late";
+    EXPECT_EQ(stored_rows()[id].status, ZV_UPLOAD_STATUS_UPLOADING);
+
+    start_service();
+    ASSERT_TRUE(wait_status(id, ZV_UPLOAD_STATUS_COMPLETED, 4 * kLongWaitMs));
+    auto row = stored_rows()[id];
+    EXPECT_EQ(row.filesize, kSize);
+    EXPECT_EQ(row.percent, 100);
+    Upload u = upload_of(id);
+    EXPECT_TRUE(u.complete);
+    EXPECT_EQ(u.total, kSize);
+    EXPECT_TRUE(same_bytes(file, u.path)) << "server copy of " << file;
+    // The rest went in one data upload behind one status query, from past 2 GiB.
+    std::vector<LoggedRequest> resumed;
+    for (const LoggedRequest &r : server_.requests_of(u.id)) {
+        EXPECT_NE(r.status, 416) << "a data upload sent bytes the server held";
+        if (r.kind == "data" && r.range_start() > 0)
+            resumed.push_back(r);
+    }
+    ASSERT_EQ(resumed.size(), 1u);
+    EXPECT_GT(resumed[0].range_start(), kTwoGiB);
+    EXPECT_EQ(resumed[0].range_start() + resumed[0].body_length, kSize);
+}
+
 // A failure of the server or of the settings: the row ends as expected and the log says why.
 struct FailureCase {
     const char *name;
@@ -312,6 +403,8 @@ TEST_P(ServiceFailureTest, RowEndsAsExpectedWithItsMessage)
 const FailureCase kFailures[] = {
     {"Http500OnDataUpload", "kind=data,action=status,status=500", true, true, true,
      ZV_UPLOAD_STATUS_PAUSED, "HTTP RESULT : 500", nullptr, false},
+    {"ContentRangeRefused", "kind=data,action=status,status=416", true, true, true,
+     ZV_UPLOAD_STATUS_PAUSED, "HTTP RESULT : 416", nullptr, false},
     {"MetadataAnswerWithoutLocation", "kind=meta,action=nolocation", true, true, true,
      ZV_UPLOAD_STATUS_PAUSED, "META UPLOAD FAIL : Clip", nullptr, false},
     {"MissingApiKey", nullptr, false, true, true, ZV_UPLOAD_STATUS_PAUSED,

@@ -151,7 +151,7 @@ class HistoryStoreTest : public ::testing::Test
         item.url = const_cast<char *>(r.url);
         item.userid = const_cast<char *>(r.userid);
         item.filename = const_cast<char *>("/videos/a.mp4");
-        item.filesize = 1234;
+        item.filesize = 5000000000LL; // past 4 GiB: a 64-bit column
         item.percent = 7;
         ASSERT_EQ(zv_ext_db_insert_item(&item), 1);
     }
@@ -279,7 +279,7 @@ TEST_F(HistoryStoreTest, LoadsInDateOrderAndKeepNulls)
     EXPECT_STREQ(rows[2].title, "third");
     EXPECT_STREQ(rows[2].url, "http://u/3");
     EXPECT_STREQ(rows[2].filename, "/videos/a.mp4");
-    EXPECT_EQ(rows[2].filesize, 1234);
+    EXPECT_EQ(rows[2].filesize, 5000000000LL);
     EXPECT_EQ(rows[2].percent, 7);
 
     Loaded ready(true);
@@ -350,7 +350,7 @@ TEST_F(HistoryStoreTest, UpdateWritesOnlyPercentStatusAndUrl)
         EXPECT_STREQ(rows[0].title, "title");
         EXPECT_STREQ(rows[0].filename, "/videos/a.mp4");
         EXPECT_STREQ(rows[0].userid, "user");
-        EXPECT_EQ(rows[0].filesize, 1234);
+        EXPECT_EQ(rows[0].filesize, 5000000000LL);
         EXPECT_DOUBLE_EQ(rows[0].date, 2.5);
         EXPECT_STREQ(rows[1].url, "http://keep");
         EXPECT_EQ(rows[1].percent, 7);

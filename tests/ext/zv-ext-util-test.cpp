@@ -2,6 +2,7 @@
 #include "zv-ext-util.h"
 
 #include <gtest/gtest.h>
+#include <unistd.h>
 
 #include <string>
 
@@ -29,8 +30,11 @@ TEST(ExtUtilFile, SizeOfFiles)
     TempDir tmp;
     ASSERT_TRUE(zv_test::write_file(tmp.file("empty"), ""));
     ASSERT_TRUE(zv_test::write_file(tmp.file("five"), "12345"));
+    ASSERT_TRUE(zv_test::write_file(tmp.file("video"), ""));
+    ASSERT_EQ(truncate(tmp.file("video").c_str(), 5000000000LL), 0); // sparse, past 4 GiB
     EXPECT_EQ(zv_ext_util_get_file_size(tmp.file("empty").c_str()), 0);
     EXPECT_EQ(zv_ext_util_get_file_size(tmp.file("five").c_str()), 5);
+    EXPECT_EQ(zv_ext_util_get_file_size(tmp.file("video").c_str()), 5000000000LL);
     EXPECT_EQ(zv_ext_util_get_file_size(tmp.file("missing").c_str()), -1);
     EXPECT_EQ(zv_ext_util_get_file_size(nullptr), -1);
 }

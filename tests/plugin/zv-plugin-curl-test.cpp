@@ -3,6 +3,7 @@
 #include <gtest/gtest.h>
 
 #include <arpa/inet.h>
+#include <fcntl.h>
 #include <netinet/in.h>
 #include <stdlib.h>
 #include <string.h>
@@ -208,7 +209,7 @@ struct Outcome {
     int result = -1;
     long http_code = -2;
     std::optional<std::string> header, body;
-    std::vector<std::pair<int, int>> progress; // percent, file_offset
+    std::vector<std::pair<int, int64_t>> progress; // percent, file_offset
 
     int call_count()
     {
@@ -239,7 +240,7 @@ void on_response(int result, TransferResponse *resp, void *user_data)
         o->body = resp->write_data;
 }
 
-void on_progress(int percent, void *user_data, int, int file_offset)
+void on_progress(int percent, void *user_data, int64_t, int64_t file_offset)
 {
     Outcome *o = static_cast<Outcome *>(user_data);
     std::lock_guard<std::mutex> lock(o->m);
@@ -266,8 +267,8 @@ void prepare(Item &item, Outcome &o, int method, const std::string &url)
 }
 
 // A PUT of `path` from `offset` with the headers of a data upload.
-void prepare_put(Item &item, Outcome &o, const std::string &url, const std::string &path, int size,
-                 int offset)
+void prepare_put(Item &item, Outcome &o, const std::string &url, const std::string &path,
+                 int64_t size, int64_t offset)
 {
     prepare(item, o, ZV_CURL_HTTP_METHOD_PUT, url);
     std::string range = "Content-Range: bytes " + std::to_string(offset) + "-" +
@@ -326,6 +327,8 @@ TEST(EngineItem, SettersRefuseBadValuesAndChangeNothing)
     const std::pair<const char *, std::function<int(TransferItem *)>> refused[] = {
         {"NULL url", [](TransferItem *i) { return zv_curl_set_url(i, nullptr); }},
         {"negative body len", [](TransferItem *i) { return zv_curl_set_body(i, "x", -1); }},
+        {"body len past the text", [](TransferItem *i) { return zv_curl_set_body(i, "x", 2); }},
+        {"len without body", [](TransferItem *i) { return zv_curl_set_body(i, nullptr, 1); }},
         {"negative timeout", [](TransferItem *i) { return zv_curl_set_timeout(i, -1); }},
         {"negative connect", [](TransferItem *i) { return zv_curl_set_connect_timeout(i, -1); }},
         {"NULL header", [](TransferItem *i) { return zv_curl_set_header(i, nullptr); }},
@@ -446,7 +449,7 @@ TEST_F(EngineTest, PutStreamsTheFileFromItsOffsetFramedByContentLength)
 {
     LoopbackServer server(answer("201 Created", "ETag: \"v1\"\r\n"));
     // size, offset, bytes the file grew by after its size was taken (never sent)
-    const std::tuple<int, int, int> cases[] = {
+    const std::tuple<int64_t, int64_t, int64_t> cases[] = {
         {1000, 400, 0}, {3 * 1024 * 1024 + 17, 0, 0}, {0, 0, 0}, {600, 100, 5000}};
     for (auto [size, offset, grown] : cases) {
         std::string data = pattern(static_cast<size_t>(size + grown));
@@ -477,9 +480,41 @@ TEST_F(EngineTest, PutStreamsTheFileFromItsOffsetFramedByContentLength)
             EXPECT_EQ(o.progress.back(), std::make_pair(100, size));
         }
         if (size == 1000) { // the first read takes all 600 bytes, the final one none
-            EXPECT_EQ(o.progress, (std::vector<std::pair<int, int>>{{100, 1000}, {100, 1000}}));
+            EXPECT_EQ(o.progress, (decltype(o.progress){{100, 1000}, {100, 1000}}));
         }
     }
+}
+
+TEST_F(EngineTest, PutPastFourGiBCountsOffsetsAndPercentInSixtyFourBits)
+{
+    // The last MiB of a sparse 5 GiB file: every offset is past the 32-bit limits.
+    LoopbackServer server(answer("201 Created"));
+    const int64_t size = 5LL << 30, offset = size - (1 << 20);
+    const std::string tail = pattern(1 << 20);
+    const std::string path = tmp_.file("big.mp4");
+    int fd = open(path.c_str(), O_CREAT | O_WRONLY, 0600);
+    ASSERT_GE(fd, 0);
+    ASSERT_EQ(pwrite(fd, tail.data(), tail.size(), offset), static_cast<ssize_t>(tail.size()));
+    close(fd);
+    Outcome o;
+    Item item;
+    prepare_put(item, o, server.url("/up"), path, size, offset);
+    exchange(item, o);
+
+    std::string raw = server.requests().back();
+    size_t head_end = raw.find("\r\n\r\n") + 4;
+    EXPECT_NE(raw.find("Content-Range: bytes 5367660544-5368709119/5368709120"), std::string::npos);
+    EXPECT_EQ(raw.substr(head_end), tail);
+    std::lock_guard<std::mutex> lock(o.m);
+    ASSERT_FALSE(o.progress.empty());
+    int64_t last = offset;
+    for (auto [percent, at] : o.progress) {
+        EXPECT_GE(at, last);
+        EXPECT_EQ(percent, static_cast<int>(100.0 * at / size));
+        last = at;
+    }
+    EXPECT_EQ(o.progress.front().first, 99);
+    EXPECT_EQ(o.progress.back(), std::make_pair(100, size));
 }
 
 TEST_F(EngineTest, EmptyPutWithoutFileAsksForTheHeldRange)
@@ -675,7 +710,7 @@ TEST_F(RunningUploadTest, PauseHoldsTheRequestAndResumeFinishesItOnTheSameConnec
     ASSERT_TRUE(o_.wait_answer());
     std::lock_guard<std::mutex> lock(o_.m);
     EXPECT_EQ(o_.http_code, 201);
-    EXPECT_EQ(o_.progress.back(), std::make_pair(100, kSize));
+    EXPECT_EQ(o_.progress.back(), std::make_pair(100, static_cast<int64_t>(kSize)));
     EXPECT_EQ(server_.body_bytes, kSize);
     EXPECT_EQ(server_.connections_, 1);
 }

@@ -310,7 +310,7 @@ protected:
         set_meta(meta);
         return send(zv_request_meta_upload, meta).value.value_or("");
     }
-    Answer data_upload(const std::string &url, int offset, const std::string &path)
+    Answer data_upload(const std::string &url, int64_t offset, const std::string &path)
     {
         Handle data(&inbox_);
         zv_set_attr_upload_url(data.h, url.c_str());
@@ -365,6 +365,7 @@ TEST_F(ClientTest, MissingValuesAreRefusedBeforeAnyTransfer)
         {zv_set_attr_keyword(a.h, nullptr), -990, "keyword is NULL"},
         {zv_set_attr_file_path(a.h, nullptr), -988, "file_path is NULL"},
         {zv_set_attr_file_offset(a.h, -1), -987, "invalid offset value"},
+        {zv_set_attr_file_offset(a.h, INT64_MAX), -987, "invalid offset value"}, // n + 1
         {zv_set_attr_region(a.h, nullptr), -986, "region is NULL"},
         {zv_set_attr_location(a.h, nullptr), -985, "location is NULL"},
         {zv_set_attr_refresh_token(a.h, nullptr), -994, "refresh_token is NULL"},
@@ -379,6 +380,10 @@ TEST_F(ClientTest, MissingValuesAreRefusedBeforeAnyTransfer)
         {(zv_set_attr_file_path(d.h, clip_.c_str()), zv_request_data_upload(d.h)), -983,
          "upload_url data is NULL"},
         {zv_request_upload_query(d.h), -983, "upload_url data is NULL"},
+        // Byte 10001 of a file of 10000 bytes.
+        {(zv_set_attr_upload_url(d.h, "http://127.0.0.1:9/u"), zv_set_attr_file_offset(d.h, 10000),
+          zv_request_data_upload(d.h)),
+         -987, "invalid offset value"},
         {zv_request_upload_pause(d.h), -998, "curl data is NULL"},
         {zv_request_upload_resume(d.h), -998, "curl data is NULL"},
         {zv_request_upload_cancel(d.h), -998, "curl data is NULL"},
@@ -618,6 +623,29 @@ TEST_F(ClientTest, DataUploadResumesBehindTheStatusQuery)
     EXPECT_EQ(rest.header("Transfer-Encoding"), std::nullopt);
     EXPECT_EQ(rest.body(), read_file(file).substr(4096));
     EXPECT_EQ(server_->stored(rest.get("upload_id")), read_file(file));
+}
+
+TEST_F(ClientTest, DataUploadPastFourGiBGoesOnBehindTheStatusAnswer)
+{
+    // The server closes the data upload at its headers: none of its 2,000,000,000 bytes move.
+    start_server({"--fault", "kind=data,action=cut,bytes=0"});
+    const std::string url = create_upload();
+    const std::string video = tmp_.file("video.mp4");
+    ASSERT_TRUE(zv_test::write_file(video, ""));
+    ASSERT_EQ(truncate(video.c_str(), 5000000000LL), 0); // sparse
+
+    // The status answer of a server holding 3,000,000,000 bytes, as the engine hands it over.
+    Handle query(&inbox_);
+    query.h->resp_type = ZV_RESP_TYPE_UPLOAD_QUERY;
+    char header[] = "HTTP/1.1 308 Resume Incomplete\r\nRange: bytes=0-2999999999\r\n\r\n";
+    TransferResponse answer = {308, header, nullptr};
+    _zv_request_curl_resp_cb(0, &answer, query.h);
+    ASSERT_EQ(inbox_.last().value, "2999999999");
+
+    data_upload(url, std::stoll(*inbox_.last().value), video);
+    const Logged put = server_->requests().back();
+    EXPECT_EQ(put.header("Content-Range"), "bytes 3000000000-4999999999/5000000000");
+    EXPECT_EQ(put.header("Content-Length"), "2000000000");
 }
 
 TEST_F(ClientTest, PausedUploadResumesAndFreedUploadNeverAnswers)

@@ -3,6 +3,7 @@
 
 #include <glib.h>
 #include <time.h>
+#include <unistd.h>
 
 #include <optional>
 #include <string>
@@ -91,8 +92,11 @@ TEST(PluginUtil, FileSize)
     zv_test::TempDir tmp;
     ASSERT_TRUE(zv_test::write_file(tmp.file("empty"), ""));
     ASSERT_TRUE(zv_test::write_file(tmp.file("ten"), "0123456789"));
+    ASSERT_TRUE(zv_test::write_file(tmp.file("video"), ""));
+    ASSERT_EQ(truncate(tmp.file("video").c_str(), 5000000000LL), 0); // sparse, past 4 GiB
     EXPECT_EQ(zv_plugin_util_get_file_size(tmp.file("empty").c_str()), 0);
     EXPECT_EQ(zv_plugin_util_get_file_size(tmp.file("ten").c_str()), 10);
+    EXPECT_EQ(zv_plugin_util_get_file_size(tmp.file("video").c_str()), 5000000000LL);
     EXPECT_EQ(zv_plugin_util_get_file_size(tmp.file("missing").c_str()), -1);
     EXPECT_EQ(zv_plugin_util_get_file_size(NULL), -1);
 }

@@ -74,6 +74,7 @@ inline bool add_row(int historyid, int status, double date, const char *filename
 struct StoredRow {
     int status = -1;
     int percent = -1;
+    int64_t filesize = -1;
     std::string url;
     bool has_url = false;
 };
@@ -88,6 +89,7 @@ inline std::map<int, StoredRow> stored_rows()
         StoredRow &r = rows[row->historyid];
         r.status = row->status;
         r.percent = row->percent;
+        r.filesize = row->filesize;
         r.has_url = row->url != nullptr;
         r.url = row->url ? row->url : "";
     }

@@ -42,9 +42,8 @@ const char kUsage[] =
     "Commands:\n"
     "  add FILE... [--title T] [--user U]\n"
     "      record each file as a READY upload; prints one line \"ID<TAB>PATH\" per file.\n"
-    "      The title defaults to the file name without its extension. Empty files and\n"
-    "      files of 2 GiB and more are refused; nothing is recorded unless every file can\n"
-    "      be read.\n"
+    "      The title defaults to the file name without its extension. Empty files are\n"
+    "      refused; nothing is recorded unless every file can be read.\n"
     "  launch --token-file FILE --category C [--description D] [--tag T]\n"
     "         [--privacy public|unlisted|private] [--location]\n"
     "      send the service the launch request that uploads every READY file\n"
@@ -235,7 +234,7 @@ class IdLock
 struct NewFile {
     std::string path; // absolute
     std::string name; // file name
-    int size = 0;
+    int64_t size = 0; // 64-bit, as the history's column: videos pass 2 GiB
     int historyid = 0;
 };
 
@@ -256,15 +255,11 @@ int check_file(const std::string &arg, NewFile *file)
     ::close(fd);
     if (st.st_size == 0)
         return complain(kExitUsage, "'%s' is empty: there is nothing to upload", arg.c_str());
-    if (st.st_size > INT_MAX)
-        return complain(kExitUsage,
-                        "'%s' is %lld bytes: the history records sizes below 2 GiB only",
-                        arg.c_str(), (long long)st.st_size);
     GCharPtr absolute(g_canonicalize_filename(arg.c_str(), nullptr));
     GCharPtr base(g_path_get_basename(absolute.get()));
     file->path = absolute.get();
     file->name = base.get();
-    file->size = (int)st.st_size;
+    file->size = static_cast<int64_t>(st.st_size);
     return 0;
 }
 

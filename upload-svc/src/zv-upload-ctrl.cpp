@@ -7,7 +7,6 @@
 #include <errno.h>
 #include <fcntl.h>
 #include <libintl.h>
-#include <limits.h>
 #include <locale.h>
 #include <string.h>
 #include <sys/stat.h>
@@ -54,7 +53,8 @@ struct JobState {
     const ServiceRequest *handle = nullptr; // the job's current request
     int status = 0;
     int percent = 0;
-    int offset = 0;
+    int64_t offset = 0;    // 64-bit, as the job's: videos pass 2 GiB
+    int64_t filesize = -1; // of the job's file when its request was made; -1: unknown
     bool has_url = false;
     std::string url;
     std::string title;
@@ -81,7 +81,6 @@ CtrlState g_ctrl;
 
 // A pipe can hold this many bytes of unread messages before the worker blocks on it.
 constexpr int kPipeBufferBytes = 1 << 20;
-constexpr off_t kMaxFileSize = 2147483647; // sizes travel as signed 32-bit ints
 
 const char *text(const char *msgid)
 {
@@ -207,6 +206,15 @@ void mark_in_flight(UploadItem *job_item, bool in_flight)
         v.in_flight = in_flight;
 }
 
+// The size of the file now, -1 when it cannot be read.
+int64_t file_size_of(const char *path)
+{
+    struct stat st;
+    if (!path || stat(path, &st) != 0)
+        return -1;
+    return static_cast<int64_t>(st.st_size);
+}
+
 // Main loop: gives the job a fresh request and releases the former one; from here on the
 // worker's answers for the former request find no job, and what they had asked for (a data
 // upload, a completion still to count) is dropped with them. Null when the job completed
@@ -225,6 +233,7 @@ ServiceRequest *renew_request(UploadItem *job_item)
         v.handle = fresh;
         v.in_flight = false;
         v.upload_due = false;
+        v.filesize = file_size_of(job_item->filename);
     }
     job_item->handle = fresh;
     if (former)
@@ -298,7 +307,7 @@ void fail_job(UploadItem *job_item)
     pause_job(job_item);
 }
 
-// Whether the job's file can be sent: present, readable, not empty and below 2 GiB.
+// Whether the job's file can be sent: present, readable and not empty, whatever its size.
 // Logs why not.
 bool file_is_sendable(const UploadItem *job_item)
 {
@@ -326,23 +335,44 @@ bool file_is_sendable(const UploadItem *job_item)
         ZV_LOGE("file of %d is empty, nothing to upload: %s", job_item->historyid, path);
         return false;
     }
-    if (st.st_size > kMaxFileSize) {
-        ZV_LOGE("file of %d is 2 GiB or more (%lld bytes): %s", job_item->historyid,
-                (long long)st.st_size, path);
-        return false;
-    }
     return true;
 }
 
-// The server's byte count of a status query answer: the last byte index it holds.
-int parse_offset(const char *value)
+// Reads the server's byte count of a status query answer into *offset: the last byte index
+// it holds, 0 when the answer names none (nothing held). A value that is no byte index of
+// the file is refused (false, *offset unchanged): not a decimal number, negative, too large
+// for 64 bits, or at or past file_size when that is known (-1: unknown).
+bool parse_offset(const char *value, int64_t file_size, int64_t *offset)
 {
-    if (!value)
-        return 0;
-    long long n = g_ascii_strtoll(value, nullptr, 10);
-    if (n < 0)
-        return 0;
-    return n > INT_MAX ? INT_MAX : (int)n;
+    if (!value) {
+        *offset = 0;
+        return true;
+    }
+    if (!g_ascii_isdigit(value[0])) // also a sign
+        return false;
+    char *end = nullptr;
+    errno = 0;
+    guint64 n = g_ascii_strtoull(value, &end, 10);
+    while (*end == ' ' || *end == '\t')
+        end++;
+    if (*end != '\0' || errno == ERANGE || n > static_cast<guint64>(INT64_MAX))
+        return false;
+    if (file_size >= 0 && static_cast<int64_t>(n) >= file_size)
+        return false;
+    *offset = static_cast<int64_t>(n);
+    return true;
+}
+
+// Worker, g_ctrl.lock held: takes a status query answer that passed into the job's view.
+// True when the data upload may go on behind the server's byte count; otherwise logs why,
+// and the job is to pause without sending anything.
+bool take_status_answer(JobState *v, const char *value)
+{
+    if (parse_offset(value, v->filesize, &v->offset))
+        return true;
+    ZV_LOGE("Range of %d names no byte of its file (%lld bytes): \"%s\"; paused, nothing sent",
+            v->historyid, (long long)v->filesize, value);
+    return false;
 }
 
 char *plural_title(int completed)
@@ -775,8 +805,7 @@ void _zv_upload_ctrl_resp_cb(int result, ServiceResponse *resp_data, void *user_
         } else {
             if (v->status != ZV_UPLOAD_STATUS_UPLOADING) {
                 // Paused while the query was out: the answer changes nothing.
-            } else if (result == ZV_ERROR_NONE) {
-                v->offset = parse_offset(resp_data->value);
+            } else if (result == ZV_ERROR_NONE && take_status_answer(v, resp_data->value)) {
                 v->status = ZV_UPLOAD_STATUS_WAITING;
                 v->upload_due = true;
                 kind = PIPE_UPLOAD;

@@ -25,10 +25,10 @@ struct UploadItem {
     char *userid;
     char *title;
     char *filename;
-    int filesize;
+    int64_t filesize; // 64-bit, as the history's column: videos pass 2 GiB
     int percent;
     char *url;
-    int offset;
+    int64_t offset; // the last byte index the server holds (status query); 0: from the start
     int status;
     double date;
     AppData *ad;

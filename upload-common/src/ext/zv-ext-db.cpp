@@ -163,6 +163,13 @@ void bind_int(sqlite3_stmt *stmt, int index, int value)
     }
 }
 
+// A size column: 64-bit, since videos pass 2 GiB. Logged as an int bind.
+void bind_int64(sqlite3_stmt *stmt, int index, int64_t value)
+{
+    if (sqlite3_bind_int64(stmt, index, value) != SQLITE_OK)
+        ZV_LOGE("sqlite3_bind_int is failed. (%s)", sqlite3_errmsg(sqlite3_db_handle(stmt)));
+}
+
 // The text is not copied: it must live until the statement has been stepped.
 void bind_text(sqlite3_stmt *stmt, int index, const char *value)
 {
@@ -240,7 +247,7 @@ int load_items(GList **list, bool ready_only)
         item->historyid = sqlite3_column_int(s, 0);
         item->title = column_text_copy(s, 1);
         item->filename = column_text_copy(s, 2);
-        item->filesize = sqlite3_column_int(s, 3);
+        item->filesize = sqlite3_column_int64(s, 3);
         item->url = column_text_copy(s, 4);
         item->percent = sqlite3_column_int(s, 5);
         item->status = sqlite3_column_int(s, 6);
@@ -420,7 +427,7 @@ int zv_ext_db_insert_item(DbItem *item)
     bind_int(s, 1, item->historyid);
     bind_text(s, 2, item->title);
     bind_text(s, 3, item->filename);
-    bind_int(s, 4, item->filesize);
+    bind_int64(s, 4, item->filesize);
     bind_text(s, 5, item->url);
     bind_int(s, 6, item->percent);
     bind_int(s, 7, item->status);

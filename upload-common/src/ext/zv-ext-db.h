@@ -8,6 +8,7 @@
 #pragma once
 
 #include <glib.h>
+#include <stdint.h>
 
 // The status column of a history row, shared with the companion client.
 typedef enum {
@@ -25,7 +26,7 @@ struct DbItem {
     char *userid;
     char *title;
     char *filename;
-    int filesize;
+    int64_t filesize; // 64-bit, as the column: videos pass 2 GiB
     int percent;
     char *url;
     int status;

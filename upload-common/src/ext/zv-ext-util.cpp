@@ -224,7 +224,7 @@ Evas_Object *zv_ext_util_create_account_select_popup(Evas_Object *parent, const 
     return popup;
 }
 
-int zv_ext_util_get_file_size(const char *path)
+int64_t zv_ext_util_get_file_size(const char *path)
 {
     ZV_LOG_ENTER();
     if (!path) {
@@ -236,12 +236,12 @@ int zv_ext_util_get_file_size(const char *path)
         ZV_LOGE("Unable to open file");
         return -1;
     }
-    if (fseek(file.get(), 0, SEEK_END) != 0)
+    if (fseeko(file.get(), 0, SEEK_END) != 0)
         return -1;
-    long size = ftell(file.get());
+    off_t size = ftello(file.get());
     if (size == -1)
         ZV_LOGE("ERROR: ftell in zuvo \n");
-    return (int)size;
+    return static_cast<int64_t>(size);
 }
 
 time_t zv_ext_util_generate_id(void)

@@ -6,6 +6,7 @@
 
 #include <Elementary.h>
 #include <glib.h>
+#include <stdint.h>
 #include <time.h>
 
 struct AppData;
@@ -40,8 +41,9 @@ Evas_Object *zv_ext_util_create_account_select_popup(Evas_Object *parent, const 
                                                      GList *account_list, Evas_Smart_Cb select_cb,
                                                      void *data);
 
-// Size of the file in bytes, or -1 when it cannot be opened or sought.
-int zv_ext_util_get_file_size(const char *path);
+// Size of the file in bytes, or -1 when it cannot be opened or sought. 64-bit: videos pass
+// 2 GiB.
+int64_t zv_ext_util_get_file_size(const char *path);
 // The current local calendar time as an id; two ids of the same second are equal.
 time_t zv_ext_util_generate_id(void);
 // True when a translated format holds exactly one conversion and it takes an int ("%d",

@@ -397,16 +397,15 @@ size_t _zv_curl_read_cb(char *ptr, size_t size, size_t nmemb, void *userp)
         return 0;
     }
     if (!item->file_stream) {
-        // An emptied item (its owner let go of it) has no file: the request is aborted.
-        if (!item->file_path) {
-            ZV_LOGE("file_path is NULL");
-            return CURL_READFUNC_ABORT;
-        }
+        // No file (a request without body, or an item emptied by its owner) ends the body
+        // here, as a file that cannot be opened does.
+        if (!item->file_path)
+            return 0;
         item->file_stream = fopen(item->file_path, "rb");
         if (!item->file_stream)
             return 0;
     }
-    if (fseeko(item->file_stream, item->file_offset, SEEK_SET) != 0)
+    if (fseeko(item->file_stream, static_cast<off_t>(item->file_offset), SEEK_SET) != 0)
         ZV_LOGE("fseek fail");
     // Never past the size the request announced (libcurl reads until a read gives 0): a file
     // that grew meanwhile sends no byte beyond its Content-Length.
@@ -416,7 +415,7 @@ size_t _zv_curl_read_cb(char *ptr, size_t size, size_t nmemb, void *userp)
     else if (want > static_cast<size_t>(item->file_size - item->file_offset))
         want = static_cast<size_t>(item->file_size - item->file_offset);
     size_t n = want ? fread(ptr, 1, want, item->file_stream) : 0;
-    item->file_offset += static_cast<int>(n);
+    item->file_offset += static_cast<int64_t>(n);
     if (item->progress_cb_func) {
         int percent = 100;
         if (item->file_size > 0)
@@ -705,14 +704,13 @@ CURL *build_easy_handle(TransferItem *item, SlistPtr *headers)
         curl_easy_setopt(c, CURLOPT_USERAGENT, item->user_agent);
     if (item->body_len > 0 && item->body) {
         // libcurl keeps its own copy, so emptying the item cannot pull the body away from a
-        // request in flight; a length past the text is cut to the text.
-        long len = static_cast<long>(std::min<size_t>(item->body_len, strlen(item->body)));
-        curl_easy_setopt(c, CURLOPT_POSTFIELDSIZE, len);
+        // request in flight. zv_curl_set_body keeps body_len within the text.
+        curl_easy_setopt(c, CURLOPT_POSTFIELDSIZE, static_cast<long>(item->body_len));
         curl_easy_setopt(c, CURLOPT_COPYPOSTFIELDS, item->body);
     } else if (item->method == ZV_CURL_HTTP_METHOD_POST) {
-        // A POST without body says "Content-Length: 0" rather than reading a body.
+        // No body option, only its length, 0: libcurl then frames the POST with
+        // "Content-Length: 0" rather than as a chunked upload from the read callback.
         curl_easy_setopt(c, CURLOPT_POSTFIELDSIZE, 0L);
-        curl_easy_setopt(c, CURLOPT_COPYPOSTFIELDS, "");
     }
     curl_easy_setopt(c, CURLOPT_WRITEFUNCTION, _zv_curl_write_cb);
     curl_easy_setopt(c, CURLOPT_WRITEDATA, item);
@@ -968,6 +966,10 @@ int zv_curl_set_body(TransferItem *item, const char *body, int len)
         ZV_LOGE("invalid body len");
         return ZV_CURL_ERROR_INVALID_PARAMETER;
     }
+    if (static_cast<size_t>(len) > (body ? strlen(body) : 0)) {
+        ZV_LOGE("invalid body len");
+        return ZV_CURL_ERROR_INVALID_PARAMETER;
+    }
     replace_text(&item->body, body);
     item->body_len = len;
     return ZV_CURL_ERROR_NONE;
@@ -1013,7 +1015,7 @@ int zv_curl_set_header(TransferItem *item, const char *header)
     return ZV_CURL_ERROR_NONE;
 }
 
-int zv_curl_set_file_info(TransferItem *item, const char *file_path, int size, int offset)
+int zv_curl_set_file_info(TransferItem *item, const char *file_path, int64_t size, int64_t offset)
 {
     ZV_CURL_CHECK_ITEM(item);
     if (!file_path) {

@@ -25,6 +25,7 @@
 
 #include <curl/curl.h>
 #include <glib.h>
+#include <stdint.h>
 #include <stdio.h>
 
 typedef enum {
@@ -67,7 +68,9 @@ struct TransferResponse {
 typedef void (*ZvCurlResponseCb)(int result, TransferResponse *resp_data, void *user_data);
 // Called after every read of the upload file, on the worker thread, with the engine lock
 // held. percent = file_offset / file_size * 100, truncated; 100 when file_size is 0.
-typedef void (*ZvCurlProgressCb)(int percent, void *user_data, int file_size, int file_offset);
+// Sizes and offsets are 64-bit here and below: videos pass 2 GiB.
+typedef void (*ZvCurlProgressCb)(int percent, void *user_data, int64_t file_size,
+                                 int64_t file_offset);
 
 // One HTTP request. Made zero-filled by zv_curl_new; fill it with the setters only.
 struct TransferItem {
@@ -78,15 +81,15 @@ struct TransferItem {
     int method;      // ZvCurlHttpMethod; any value but POST and PUT sends a GET
     char *url;
     char *body; // sent as the POST fields when body_len is above 0
-    int body_len;
+    int body_len;        // at most the length of body
     GList *header_list;  // char* lines such as "Name: value"; "Name:" removes that header
     int timeout;         // whole request, ms; 0 keeps the library default
     int connect_timeout; // connection phase, ms; 0 keeps the library default
     char *user_agent;
     FILE *file_stream; // the upload file, opened by the first read
     char *file_path;   // the file whose bytes are the body of a PUT
-    int file_size;
-    int file_offset;        // next byte of the file to send; advanced by every read
+    int64_t file_size; // 64-bit: videos pass 2 GiB
+    int64_t file_offset;    // next byte of the file to send; advanced by every read
     GList *write_data_list; // TransferChunk*: the response body as it arrived
     int write_data_len;
     GList *header_data_list; // TransferChunk*: the response header lines as they arrived
@@ -138,11 +141,13 @@ int zv_curl_set_progress_cb_func(TransferItem *item, ZvCurlProgressCb progress_c
 int zv_curl_set_user_data(TransferItem *item, void *user_data);
 int zv_curl_set_method(TransferItem *item, int method);
 int zv_curl_set_url(TransferItem *item, const char *url);
-// body may be NULL; len is taken as given (pass the length of the text); negative: 4.
+// body may be NULL; len is the number of its bytes to send: negative, or longer than the
+// text (0 for NULL), is refused with 4, so that nothing reads past the copy.
 int zv_curl_set_body(TransferItem *item, const char *body, int len);
 int zv_curl_set_timeout(TransferItem *item, int timeout_ms);
 int zv_curl_set_connect_timeout(TransferItem *item, int timeout_ms);
 int zv_curl_set_user_agent(TransferItem *item, const char *user_agent); // NULL clears
 int zv_curl_set_header(TransferItem *item, const char *header);         // appended
-int zv_curl_set_file_info(TransferItem *item, const char *file_path, int size, int offset);
+// A negative size or offset is refused with 4.
+int zv_curl_set_file_info(TransferItem *item, const char *file_path, int64_t size, int64_t offset);
 int zv_curl_set_netwrok_info(TransferItem *item, const char *ip, const char *proxy);

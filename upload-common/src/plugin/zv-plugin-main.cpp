@@ -8,6 +8,7 @@
 #include "zv-plugin-main.h"
 
 #include <glib.h>
+#include <inttypes.h>
 #include <key_storage.h>
 #include <stdio.h>
 #include <stdlib.h>
@@ -323,14 +324,14 @@ int zv_set_attr_privacy(ServiceRequest *zv_handle, int privacy)
     return ZV_ERROR_NONE;
 }
 
-int zv_set_attr_file_offset(ServiceRequest *zv_handle, int offset)
+int zv_set_attr_file_offset(ServiceRequest *zv_handle, int64_t offset)
 {
     ZV_LOG_ENTER();
     if (!zv_handle) {
         ZV_LOGE("handle is NULL");
         return ZV_ERROR_INVALID_HANDLE;
     }
-    if (offset < 0) {
+    if (offset < 0 || offset == INT64_MAX) {
         ZV_LOGE("invalid offset value");
         return ZV_ERROR_INVALID_OFFSET;
     }
@@ -498,6 +499,12 @@ int zv_request_data_upload(ServiceRequest *zv_handle)
         return ZV_ERROR_INVALID_URL;
     }
 
+    // The size of a file that cannot be read (-1) is the engine's to refuse.
+    if (zv_handle->file_size >= 0 && zv_handle->file_offset > zv_handle->file_size) {
+        ZV_LOGE("invalid offset value");
+        return ZV_ERROR_INVALID_OFFSET;
+    }
+
     char header[HEADER_BUF_SIZE] = {0};
     TransferItem *item = new_transfer(zv_handle);
     if (!item)
@@ -509,16 +516,17 @@ int zv_request_data_upload(ServiceRequest *zv_handle)
     zv_handle->resp_type = ZV_RESP_TYPE_DATA_UPLOAD;
 
     GText agent = user_agent_text();
-    const int size = zv_handle->file_size;
-    const int offset = zv_handle->file_offset;
+    const int64_t size = zv_handle->file_size;
+    const int64_t offset = zv_handle->file_offset;
     bool ok = CURL_OK(zv_curl_set_callback_func, item, _zv_request_curl_resp_cb) &&
               CURL_OK(zv_curl_set_progress_cb_func, item, _zv_request_curl_progress_cb) &&
               CURL_OK(zv_curl_set_user_data, item, zv_handle) &&
               CURL_HEADER(item, header, "Content-Type: %s", media_type) &&
-              CURL_HEADER(item, header, "Content-Range: bytes %d-%d/%d", offset, size - 1, size) &&
+              CURL_HEADER(item, header, "Content-Range: bytes %" PRId64 "-%" PRId64 "/%" PRId64,
+                          offset, size - 1, size) &&
               CURL_HEADER(item, header, "Expect:") &&
               CURL_OK(zv_curl_set_netwrok_info, item, g_client.ip, g_client.proxy) &&
-              CURL_HEADER(item, header, "Content-Length: %d", size - offset) &&
+              CURL_HEADER(item, header, "Content-Length: %" PRId64, size - offset) &&
               CURL_HEADER(item, header, "Connection: Keep-Alive") &&
               CURL_HEADER(item, header, "keep-alive: %d", KEEP_ALIVE_SECONDS) &&
               CURL_OK(zv_curl_set_method, item, ZV_CURL_HTTP_METHOD_PUT) &&
@@ -733,8 +741,8 @@ void _zv_request_curl_resp_cb(int result, TransferResponse *curl_resp, void *use
     free(resp_data);
 }
 
-void _zv_request_curl_progress_cb(int percent, void *user_data, int /*file_size*/,
-                                  int /*file_offset*/)
+void _zv_request_curl_progress_cb(int percent, void *user_data, int64_t /*file_size*/,
+                                  int64_t /*file_offset*/)
 {
     auto *zv_handle = static_cast<ServiceRequest *>(user_data);
     if (!zv_handle) {

@@ -71,8 +71,9 @@ struct ServiceRequest {
     double latitude; // 0.0 with longitude 0.0: no position known
     double longitude;
     char *upload_url;
-    int file_offset; // index of the next byte of the file to send
-    int file_size;
+    // 64-bit, as the transfer's: videos pass 2 GiB.
+    int64_t file_offset; // index of the next byte of the file to send
+    int64_t file_size;   // -1 when the file cannot be read
     char *region;
     char *refresh_token;
 };
@@ -118,8 +119,10 @@ int zv_set_attr_privacy(ServiceRequest *zv_handle, int privacy);
 // Also sets file_size to the file's size (-1 when it cannot be opened; still 0 returned).
 int zv_set_attr_file_path(ServiceRequest *zv_handle, const char *file_path);
 // `offset` is the last byte index the server holds (status query), or 0 for a fresh start:
-// 0 stores 0, n > 0 stores n + 1; negative is refused.
-int zv_set_attr_file_offset(ServiceRequest *zv_handle, int offset);
+// 0 stores 0, n > 0 stores n + 1; negative, and INT64_MAX (whose n + 1 overflows), are
+// refused with -987. The file path may come later, so the file's size is checked by
+// zv_request_data_upload.
+int zv_set_attr_file_offset(ServiceRequest *zv_handle, int64_t offset);
 int zv_set_attr_region(ServiceRequest *zv_handle, const char *region);
 int zv_set_attr_location(ServiceRequest *zv_handle, const char *location);
 int zv_set_attr_gps(ServiceRequest *zv_handle, double latitude, double longitude);
@@ -127,6 +130,7 @@ int zv_set_attr_refresh_token(ServiceRequest *zv_handle, const char *refresh_tok
 
 // Request operations: 0 when the transfer is queued (exactly one resp_cb follows unless it is
 // cancelled), or a ServiceError; nothing is queued then and the handle's attributes are kept.
+// zv_request_data_upload refuses a file offset past the file's size with -987.
 int zv_request_login(ServiceRequest *zv_handle);
 int zv_request_get_token(ServiceRequest *zv_handle);
 int zv_request_meta_upload(ServiceRequest *zv_handle);
@@ -141,4 +145,5 @@ int zv_request_upload_cancel(ServiceRequest *zv_handle);
 
 // The transfers' callbacks (the handle is their user data). Worker thread, engine lock held.
 void _zv_request_curl_resp_cb(int result, TransferResponse *resp_data, void *user_data);
-void _zv_request_curl_progress_cb(int percent, void *user_data, int file_size, int file_offset);
+void _zv_request_curl_progress_cb(int percent, void *user_data, int64_t file_size,
+                                  int64_t file_offset);

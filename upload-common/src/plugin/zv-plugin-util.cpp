@@ -3,7 +3,6 @@
 #include "zv-plugin-util.h"
 
 #include <glib.h>
-#include <limits.h>
 #include <stdio.h>
 #include <stdlib.h>
 #include <string.h>
@@ -110,7 +109,7 @@ char *zv_plugin_util_get_file_name(const char *path)
     return g_strdup(name);
 }
 
-int zv_plugin_util_get_file_size(const char *path)
+int64_t zv_plugin_util_get_file_size(const char *path)
 {
     ZV_LOG_ENTER();
     if (!path) {
@@ -122,17 +121,14 @@ int zv_plugin_util_get_file_size(const char *path)
         ZV_LOGE("Unable to open file");
         return -1;
     }
-    if (fseek(file.get(), 0, SEEK_END) != 0)
+    if (fseeko(file.get(), 0, SEEK_END) != 0)
         return -1;
-    long size = ftell(file.get());
+    off_t size = ftello(file.get());
     if (size == -1) {
         ZV_LOGE("ERROR: ftell in zuvo \n");
         return -1;
     }
-    // A size that does not fit the signed 32-bit result is refused rather than wrapped.
-    if (size > INT_MAX)
-        return -1;
-    return static_cast<int>(size);
+    return static_cast<int64_t>(size);
 }
 
 int zv_plugin_util_generate_id(void)

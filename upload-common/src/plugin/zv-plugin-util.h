@@ -7,15 +7,16 @@
 // Every returned char* is a fresh copy: release it with g_free (or free).
 #pragma once
 
+#include <stdint.h>
+
 // The media type of the path's last extension ("video/mp4" for "clip.MP4"), or NULL for an
 // unknown extension, no "." or a NULL path. Static text: never freed.
 const char *zv_plugin_util_get_file_mime(const char *file_path);
 // The text after the last "/" (the whole path without one; "" for a path ending in "/"),
 // or NULL for a NULL path.
 char *zv_plugin_util_get_file_name(const char *path);
-// The file's size in bytes, or -1 when it cannot be read. Files of 2 GiB or more are not
-// supported.
-int zv_plugin_util_get_file_size(const char *path);
+// The file's size in bytes, or -1 when it cannot be read. 64-bit: videos pass 2 GiB.
+int64_t zv_plugin_util_get_file_size(const char *path);
 // The current time in whole seconds since the epoch.
 int zv_plugin_util_generate_id(void);
 
