@@ -145,11 +145,13 @@ TEST_F(NotiTest, UnreadableTrayFileIsTakenAsAbsentAndLogged)
     const char *broken[] = {"not a key file at all [[[\n",
                             "[notification]\ntype=ongoing\ndisplay_applist=lots\n",
                             "[other]\ntype=noti\n"};
+    double progress = 0.5;
     for (const char *text : broken) {
         SCOPED_TRACE(text);
         ASSERT_TRUE(zv_test::write_file(tray_file(kOngoing), text));
         g_log.mark();
-        zuvo_ext_noti_ongoing_noti_update("Uploading", "b.mp4", 0, 1, 0.5);
+        progress += 0.1; // an update that changes nothing is not written again
+        zuvo_ext_noti_ongoing_noti_update("Uploading", "b.mp4", 0, 1, progress);
         EXPECT_TRUE(g_log.logged("is not a notification"));
         EXPECT_TRUE(g_log.logged("ongoing_noti_h is NULL. So, create it."));
         EXPECT_EQ(keys(kOngoing)["content"], "b.mp4");

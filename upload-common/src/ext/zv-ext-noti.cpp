@@ -7,6 +7,8 @@
 #include <glib.h>
 #include <notification.h>
 
+#include <string>
+
 #include "zv-log.h"
 
 namespace
@@ -62,6 +64,28 @@ void set_tag_logged(notification_h noti, const char *tag)
     if (ret != NOTIFICATION_ERROR_NONE)
         ZV_LOGE("Fail to notification_set_tag : %d", ret);
 }
+
+// What the ongoing notification shows now, as this process last posted it. A progress
+// report of a one-job batch asks for an update per read of the file; one that would show the
+// same texts, count and bar is not written to the tray again.
+struct OngoingShown {
+    bool valid = false;
+    std::string title;
+    std::string sub;
+    int current = 0;
+    int total = 0;
+    double progress = 0;
+
+    bool same(const char *t, const char *s, int c, int n, double p) const
+    {
+        return valid && title == t && sub == s && current == c && total == n && progress == p;
+    }
+    void set(const char *t, const char *s, int c, int n, double p)
+    {
+        *this = {true, t, s, c, n, p};
+    }
+};
+OngoingShown g_shown;
 
 } // namespace
 
@@ -126,6 +150,7 @@ int zuvo_ext_noti_ongoing_noti_create(const char *title_text, const char *sub_tx
     if (g_noti.ongoing)
         notification_free(g_noti.ongoing);
     g_noti.ongoing = noti;
+    g_shown.set(title_text, sub_txt, current, total, progress);
     return 1;
 }
 
@@ -140,6 +165,8 @@ void zuvo_ext_noti_ongoing_noti_update(const char *title_text, const char *sub_t
         ZV_LOGE("sub_txt is NULL");
         return;
     }
+    if (g_shown.same(title_text, sub_txt, current, total, progress))
+        return;
     notification_h noti = notification_load_by_tag(kOngoingTag);
     if (!noti) {
         ZV_LOGI("ongoing_noti_h is NULL. So, create it.");
@@ -152,12 +179,15 @@ void zuvo_ext_noti_ongoing_noti_update(const char *title_text, const char *sub_t
     int ret = notification_update(noti);
     if (ret != NOTIFICATION_ERROR_NONE)
         ZV_LOGE("Fail to notification_update : %d", ret);
+    else
+        g_shown.set(title_text, sub_txt, current, total, progress);
     notification_free(noti);
 }
 
 void zuvo_ext_noti_ongoing_noti_destroy(void)
 {
     ZV_LOG_ENTER();
+    g_shown.valid = false;
     notification_h noti = notification_load_by_tag(kOngoingTag);
     if (!noti) {
         dlog_print(DLOG_WARN, ZV_LOG_TAG,
