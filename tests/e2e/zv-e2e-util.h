@@ -8,6 +8,7 @@
 #include <curl/curl.h>
 #include <signal.h>
 #include <stdlib.h>
+#include <sys/resource.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
@@ -26,8 +27,8 @@ namespace zv_e2e
 
 using Env = std::vector<std::pair<std::string, std::string>>;
 
-// A child process whose standard output and error go to a file; killed at destruction when
-// it still runs.
+// A child process whose standard output and error go to a file, under an open-file limit (soft
+// and hard) when nofile is above 0; killed at destruction when it still runs.
 class Child
 {
   public:
@@ -43,7 +44,7 @@ class Child
     }
 
     bool start(const std::vector<std::string> &argv, const std::string &out_path,
-               const Env &env = {})
+               const Env &env = {}, rlim_t nofile = 0)
     {
         pid_ = fork();
         if (pid_ < 0)
@@ -56,6 +57,9 @@ class Child
             }
             for (const auto &kv : env)
                 setenv(kv.first.c_str(), kv.second.c_str(), 1);
+            rlimit limit = {nofile, nofile};
+            if (nofile > 0 && setrlimit(RLIMIT_NOFILE, &limit) != 0)
+                _exit(126);
             std::vector<char *> args;
             for (const auto &a : argv)
                 args.push_back(const_cast<char *>(a.c_str()));
