@@ -3,8 +3,9 @@
 # (zv-engine-bench) and the whole service (zv-service-bench).
 # ZV_BENCH_BUILD: the build folder (default build/). Arguments go to zv-engine-bench
 # (--size-mib N, --rounds N, --requests N); ZV_SERVICE_BENCH_ARGS to zv-service-bench
-# (--size-mib N, --jobs N, --job-mib N, --rows N). The engine's server is zuvo-devserver when
-# the build has it, else the benchmark's own sink server.
+# (--size-mib N, --jobs N, --job-mib N, --rows N, --limit-jobs N, --nofile N: the batch of
+# 64 KiB jobs with the service alone under an open-file limit). The engine's server is
+# zuvo-devserver when the build has it, else the benchmark's own sink server.
 set -euo pipefail
 cd "$(dirname "$0")/.."
 
