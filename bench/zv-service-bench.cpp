@@ -4,10 +4,13 @@
 //   2. a video past 2 GiB (2 GiB + 64 MiB) through the service next to curl for the same
 //      file, and the service's peak memory, which must not grow with the file's size;
 //   3. many jobs at once: time, the service's peak memory, byte-identical copies;
-//   4. start-up with a long history (thumbnails included) to the first drawn job list.
+//   4. a batch of the history's size (5,000 jobs of 64 KiB) with the service alone under an
+//      open-file limit of 1,024, soft and hard: time, peak memory, byte-identical copies;
+//   5. start-up with a long history (thumbnails included) to the first drawn job list.
 // Prints each figure with its target.
 //
 //   zv-service-bench [--bin DIR] [--size-mib N] [--jobs N] [--job-mib N] [--rows N]
+//                    [--limit-jobs N] [--nofile N]
 //
 // DIR holds zuvo-upload-svc, zuvo-client, zuvo-devserver, zv-vconf and zv-keystore (default:
 // this program's folder). Every run gets a fresh world of its own (ZV_* environment) in a
@@ -93,7 +96,7 @@ bool make_file(const std::string &path, long long bytes, unsigned seed)
     FILE *f = fopen(path.c_str(), "wb");
     if (!f)
         return false;
-    std::vector<char> block(4 << 20);
+    std::vector<char> block(static_cast<size_t>(std::min<long long>(bytes, 4 << 20)));
     std::mt19937 gen(seed);
     for (char &c : block)
         c = static_cast<char>(gen());
@@ -164,8 +167,9 @@ struct World {
         return ok;
     }
 
-    // The service with a batch's launch request (or none), its output dropped.
-    void start_service(bool with_batch)
+    // The service with a batch's launch request (or none), its output dropped; under an
+    // open-file limit (soft and hard, as prlimit sets it) when nofile is above 0.
+    void start_service(bool with_batch, rlim_t nofile = 0)
     {
         std::vector<std::string> argv = {program("zuvo-upload-svc")};
         if (with_batch)
@@ -177,6 +181,9 @@ struct World {
             dup2(null_fd, STDIN_FILENO);
             dup2(null_fd, STDOUT_FILENO);
             dup2(null_fd, STDERR_FILENO);
+            rlimit limit = {nofile, nofile};
+            if (nofile > 0 && setrlimit(RLIMIT_NOFILE, &limit) != 0)
+                _exit(126);
             std::vector<char *> args;
             for (const std::string &a : argv)
                 args.push_back(const_cast<char *>(a.c_str()));
@@ -436,6 +443,34 @@ bool bench_video_past_2gib(const std::string &root)
     return time_pass && rss_pass;
 }
 
+// How many of the files the server holds byte for byte: the metadata document of each stored
+// copy names the title "job-N" of files[N - 1].
+int identical_copies(const World &world, const std::vector<std::string> &files)
+{
+    std::map<std::string, std::string> data_of_title;
+    glob_t found{};
+    if (glob((world.storage + "/*.atom.xml").c_str(), 0, nullptr, &found) == 0) {
+        for (size_t i = 0; i < found.gl_pathc; ++i) {
+            std::string meta_path = found.gl_pathv[i];
+            std::string meta = read_file(meta_path);
+            size_t at = meta.find(">job-");
+            if (at == std::string::npos)
+                continue;
+            std::string title = meta.substr(at + 1, meta.find('<', at) - at - 1);
+            data_of_title[title] =
+                meta_path.substr(0, meta_path.size() - strlen(".atom.xml")) + ".data";
+        }
+    }
+    globfree(&found);
+    int identical = 0;
+    for (size_t i = 0; i < files.size(); ++i) {
+        auto it = data_of_title.find("job-" + std::to_string(i + 1));
+        if (it != data_of_title.end() && read_file(it->second) == read_file(files[i]))
+            ++identical;
+    }
+    return identical;
+}
+
 bool bench_many_jobs(const std::string &root, int jobs, int job_mib)
 {
     World world;
@@ -456,34 +491,80 @@ bool bench_many_jobs(const std::string &root, int jobs, int job_mib)
     double total = seconds_since(t0);
     peak = std::max(peak, world.service_peak_kib());
     world.close();
-
-    // Every stored copy against its file: the metadata document names the title.
-    std::map<std::string, std::string> data_of_title;
-    glob_t found{};
-    if (glob((world.storage + "/*.atom.xml").c_str(), 0, nullptr, &found) == 0) {
-        for (size_t i = 0; i < found.gl_pathc; ++i) {
-            std::string meta_path = found.gl_pathv[i];
-            std::string meta = read_file(meta_path);
-            size_t at = meta.find(">job-");
-            if (at == std::string::npos)
-                continue;
-            std::string title = meta.substr(at + 1, meta.find('<', at) - at - 1);
-            data_of_title[title] =
-                meta_path.substr(0, meta_path.size() - strlen(".atom.xml")) + ".data";
-        }
-    }
-    globfree(&found);
-    int identical = 0;
-    for (int i = 0; i < jobs; ++i) {
-        auto it = data_of_title.find("job-" + std::to_string(i + 1));
-        if (it != data_of_title.end() && read_file(it->second) == read_file(files[i]))
-            ++identical;
-    }
+    int identical = identical_copies(world, files);
     bool pass = waited >= 0 && identical == jobs;
     report("many jobs at once",
            fmt("%.0f x %.0f MiB in %.2f s", jobs, job_mib, total) +
                fmt(", peak %.0f MiB, %.0f byte-identical", peak / 1024.0, identical),
            "all identical", pass);
+    return pass;
+}
+
+// Records the files as READY rows titled "job-N" straight into the history (the companion
+// would make a thumbnail of each, minutes for thousands of files).
+bool record_rows(const std::vector<std::string> &files)
+{
+    if (!zv_ext_db_open())
+        return false;
+    zv_ext_db_close();
+    sqlite3 *db = nullptr;
+    if (sqlite3_open(getenv("ZV_HISTORY_DB"), &db) != SQLITE_OK)
+        return false;
+    sqlite3_exec(db, "begin", nullptr, nullptr, nullptr);
+    sqlite3_stmt *stmt = nullptr;
+    sqlite3_prepare_v2(db,
+                       "insert into history (historyid, title, filename, filesize, url, percent, "
+                       "status, userid, date) values (?, ?, ?, ?, '', 0, 0, 'bench', ?)",
+                       -1, &stmt, nullptr);
+    bool ok = stmt != nullptr;
+    for (size_t i = 0; ok && i < files.size(); ++i) {
+        struct stat st;
+        std::string title = "job-" + std::to_string(i + 1);
+        sqlite3_bind_int(stmt, 1, static_cast<int>(i + 1));
+        sqlite3_bind_text(stmt, 2, title.c_str(), -1, SQLITE_TRANSIENT);
+        sqlite3_bind_text(stmt, 3, files[i].c_str(), -1, SQLITE_TRANSIENT);
+        sqlite3_bind_int64(stmt, 4, stat(files[i].c_str(), &st) == 0 ? st.st_size : 0);
+        sqlite3_bind_double(stmt, 5, 1.7e9 + static_cast<double>(i));
+        ok = sqlite3_step(stmt) == SQLITE_DONE;
+        sqlite3_reset(stmt);
+    }
+    sqlite3_finalize(stmt);
+    ok = sqlite3_exec(db, "commit", nullptr, nullptr, nullptr) == SQLITE_OK && ok;
+    sqlite3_close(db);
+    return ok;
+}
+
+// A batch of the history's size on a normal machine's open-file limit: the service alone
+// starts under it (soft and hard, so that it cannot raise the soft one), the server without.
+bool bench_file_limit(const std::string &root, int jobs, int nofile)
+{
+    World world;
+    if (!world.open(root, "limit", true))
+        return false;
+    std::vector<std::string> files;
+    for (int i = 0; i < jobs; ++i) {
+        files.push_back(world.dir + "/job-" + std::to_string(i + 1) + ".mp4");
+        if (!make_file(files.back(), 64 << 10, 100 + i))
+            return false;
+    }
+    if (!record_rows(files))
+        return false;
+    long peak = 0;
+    auto t0 = Clock::now();
+    world.start_service(true, static_cast<rlim_t>(nofile));
+    double waited = wait_all_completed(jobs, 900, t0, world, &peak);
+    double total = seconds_since(t0);
+    peak = std::max(peak, world.service_peak_kib());
+    world.close();
+    int identical = identical_copies(world, files);
+    bool pass = waited >= 0 && identical == jobs && peak < 256 * 1024;
+    report(fmt("%.0f jobs, %.0f open files", jobs, nofile).c_str(),
+           waited < 0 ? fmt("%.0f of %.0f completed in %.0f s", status_counts()[kCompleted], jobs,
+                            total)
+                      : fmt("last done %.2f s after the start, peak %.0f MiB", total,
+                            peak / 1024.0) +
+                            fmt(", %.0f byte-identical", identical),
+           "< 256 MiB, all", pass);
     return pass;
 }
 
@@ -580,7 +661,7 @@ bool bench_startup(const std::string &root, int rows)
 
 int main(int argc, char **argv)
 {
-    int size_mib = 1024, jobs = 50, job_mib = 20, rows = 5000;
+    int size_mib = 1024, jobs = 50, job_mib = 20, rows = 5000, limit_jobs = 5000, nofile = 1024;
     char self[4096];
     ssize_t n = readlink("/proc/self/exe", self, sizeof self - 1);
     self[n > 0 ? n : 0] = '\0';
@@ -597,6 +678,10 @@ int main(int argc, char **argv)
             job_mib = atoi(argv[++i]);
         else if (a == "--rows" && i + 1 < argc)
             rows = atoi(argv[++i]);
+        else if (a == "--limit-jobs" && i + 1 < argc)
+            limit_jobs = atoi(argv[++i]);
+        else if (a == "--nofile" && i + 1 < argc)
+            nofile = atoi(argv[++i]);
         else {
             fprintf(stderr, "zv-service-bench: unknown argument %s\n", argv[i]);
             return 2;
@@ -612,8 +697,9 @@ int main(int argc, char **argv)
         return 1;
     }
     std::string root = tmpl;
-    printf("programs from %s; %d MiB upload, %d jobs of %d MiB, %d rows\n", g_bin.c_str(),
-           size_mib, jobs, job_mib, rows);
+    printf("programs from %s; %d MiB upload, %d jobs of %d MiB, %d jobs of 64 KiB under %d open "
+           "files, %d rows\n",
+           g_bin.c_str(), size_mib, jobs, job_mib, limit_jobs, nofile, rows);
 
     // This process's own log (the engine's) is not the figure; the services log to their worlds.
     setenv("ZV_DLOG_FILE", "/dev/null", 1);
@@ -622,6 +708,7 @@ int main(int argc, char **argv)
     all &= bench_video_past_2gib(root);
     zv_curl_finalize_service();
     all &= bench_many_jobs(root, jobs, job_mib);
+    all &= bench_file_limit(root, limit_jobs, nofile);
     all &= bench_startup(root, rows);
 
     if (getenv("ZV_BENCH_KEEP")) {

@@ -6,9 +6,12 @@
 // or close what this one showed. A notification with a launch application carries the
 // desktop's default action: invoking it (a click) sends that application a launch request,
 // as a tap in the phone's tray does.
+// A tray file that cannot be written (no descriptor left, a full disk) is written again on a
+// timer of the main loop until it lands.
 #include "notification.h"
 #include "zv-platform-util.h"
 
+#include <Ecore.h>
 #include <Eldbus.h>
 #include <app.h>
 #include <errno.h>
@@ -192,18 +195,15 @@ bool from_key_file(const std::string &path, _notification *n, std::string *why)
     return true;
 }
 
-int write_tray_file(const _notification &n)
+// Writes the tray file of n; false (errno set) when it could not.
+bool store_tray_file(const _notification &n)
 {
     std::string dir = ensure_tray_dir();
     if (dir.empty())
-        return NOTIFICATION_ERROR_IO_ERROR;
+        return false;
     // The tray is volatile, like the runtime folder: no flush to the disk for every update of
     // an ongoing notification.
-    if (!zv_platform_replace_file(dir + "/" + n.tag + ".ini", to_key_file(n), false)) {
-        ZV_LOGE("notification %s: %s", n.tag.c_str(), strerror(errno));
-        return NOTIFICATION_ERROR_IO_ERROR;
-    }
-    return NOTIFICATION_ERROR_NONE;
+    return zv_platform_replace_file(dir + "/" + n.tag + ".ini", to_key_file(n), false);
 }
 
 // Shows posted notifications on the desktop's notification service, best effort: without a
@@ -440,6 +440,70 @@ DesktopNotifier &desktop()
     return notifier;
 }
 
+// The notifications whose tray file could not be written, by tag, as last posted or updated:
+// written again every half second until they land, so that the tray does not stay behind.
+// A later write or a delete of the tag takes their place; loading the tag answers them.
+class TrayBacklog
+{
+  public:
+    void keep(const _notification &n)
+    {
+        latest_[n.tag] = n;
+        if (!timer_)
+            timer_ = ecore_timer_add(kRetrySeconds, retry_cb, this);
+    }
+    bool drop(const std::string &tag) { return latest_.erase(tag) > 0; }
+    const _notification *find(const std::string &tag) const
+    {
+        auto it = latest_.find(tag);
+        return it == latest_.end() ? nullptr : &it->second;
+    }
+
+  private:
+    static constexpr double kRetrySeconds = 0.5;
+
+    static Eina_Bool retry_cb(void *data)
+    {
+        auto *self = static_cast<TrayBacklog *>(data);
+        for (auto it = self->latest_.begin(); it != self->latest_.end();) {
+            if (!store_tray_file(it->second)) {
+                ++it;
+                continue;
+            }
+            ZV_LOGI("notification %s written on a later try", it->first.c_str());
+            desktop().show(it->second);
+            it = self->latest_.erase(it);
+        }
+        if (!self->latest_.empty())
+            return ECORE_CALLBACK_RENEW;
+        self->timer_ = nullptr;
+        return ECORE_CALLBACK_CANCEL;
+    }
+
+    std::map<std::string, _notification> latest_;
+    Ecore_Timer *timer_ = nullptr;
+};
+
+TrayBacklog &backlog()
+{
+    static TrayBacklog pending;
+    return pending;
+}
+
+// Writes the tray file of n and shows it on the desktop; one that cannot be written now is
+// logged and kept for a later try.
+int write_tray_file(const _notification &n)
+{
+    if (!store_tray_file(n)) {
+        ZV_LOGE("notification %s: %s; written again later", n.tag.c_str(), strerror(errno));
+        backlog().keep(n);
+        return NOTIFICATION_ERROR_IO_ERROR;
+    }
+    backlog().drop(n.tag);
+    desktop().show(n);
+    return NOTIFICATION_ERROR_NONE;
+}
+
 } // namespace
 
 notification_h notification_create(notification_type_e type)
@@ -456,6 +520,8 @@ notification_h notification_load_by_tag(const char *tag)
 {
     if (!valid_tag(tag))
         return nullptr;
+    if (const _notification *unwritten = backlog().find(tag))
+        return new (std::nothrow) _notification(*unwritten);
     std::string path = tray_file(tag);
     if (path.empty() || !g_file_test(path.c_str(), G_FILE_TEST_EXISTS))
         return nullptr;
@@ -639,10 +705,7 @@ int notification_post(notification_h noti)
         noti->tag = "noti-" + std::to_string(getpid()) + "-" + std::to_string(++serial) + "-" +
                     std::to_string(g_get_real_time());
     }
-    int rc = write_tray_file(*noti);
-    if (rc == NOTIFICATION_ERROR_NONE)
-        desktop().show(*noti);
-    return rc;
+    return write_tray_file(*noti);
 }
 
 int notification_update(notification_h noti)
@@ -652,12 +715,9 @@ int notification_update(notification_h noti)
     std::string path = tray_file(noti->tag);
     if (path.empty())
         return NOTIFICATION_ERROR_IO_ERROR;
-    if (!g_file_test(path.c_str(), G_FILE_TEST_EXISTS))
+    if (!g_file_test(path.c_str(), G_FILE_TEST_EXISTS) && !backlog().find(noti->tag))
         return NOTIFICATION_ERROR_NOT_EXIST_ID;
-    int rc = write_tray_file(*noti);
-    if (rc == NOTIFICATION_ERROR_NONE)
-        desktop().show(*noti);
-    return rc;
+    return write_tray_file(*noti);
 }
 
 int notification_delete(notification_h noti)
@@ -667,7 +727,8 @@ int notification_delete(notification_h noti)
     std::string path = tray_file(noti->tag);
     if (path.empty())
         return NOTIFICATION_ERROR_IO_ERROR;
-    if (g_unlink(path.c_str()) != 0) {
+    bool unwritten = backlog().drop(noti->tag);
+    if (g_unlink(path.c_str()) != 0 && !(errno == ENOENT && unwritten)) {
         if (errno == ENOENT)
             return NOTIFICATION_ERROR_NOT_EXIST_ID;
         ZV_LOGE("notification %s: %s", noti->tag.c_str(), g_strerror(errno));

@@ -7,8 +7,9 @@
 # their thumbnails.
 # ZV_BENCH_BUILD: the build folder (default build/). Arguments go to zv-engine-bench
 # (--size-mib N, --rounds N, --requests N); ZV_SERVICE_BENCH_ARGS to zv-service-bench
-# (--size-mib N, --jobs N, --job-mib N, --rows N); ZV_COMPANION_BENCH_FILES the numbers of
-# videos the companion records (default "200 1000").
+# (--size-mib N, --jobs N, --job-mib N, --rows N, --limit-jobs N, --nofile N: the batch of
+# 64 KiB jobs with the service alone under an open-file limit); ZV_COMPANION_BENCH_FILES the
+# numbers of videos the companion records (default "200 1000").
 set -euo pipefail
 cd "$(dirname "$0")/.."
 

@@ -10,6 +10,7 @@
 #include <curl/curl.h>
 #include <signal.h>
 #include <stdlib.h>
+#include <sys/resource.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
@@ -47,8 +48,8 @@ inline std::map<pid_t, int> &reaped_by_loop()
     return statuses;
 }
 
-// A child process whose standard output and error go to a file; killed at destruction when
-// it still runs.
+// A child process whose standard output and error go to a file, under an open-file limit (soft
+// and hard) when nofile is above 0; killed at destruction when it still runs.
 class Child
 {
   public:
@@ -64,7 +65,7 @@ class Child
     }
 
     bool start(const std::vector<std::string> &argv, const std::string &out_path,
-               const Env &env = {})
+               const Env &env = {}, rlim_t nofile = 0)
     {
         reaped_by_loop();
         killed_ = false;
@@ -79,6 +80,9 @@ class Child
             }
             for (const auto &kv : env)
                 setenv(kv.first.c_str(), kv.second.c_str(), 1);
+            rlimit limit = {nofile, nofile};
+            if (nofile > 0 && setrlimit(RLIMIT_NOFILE, &limit) != 0)
+                _exit(126);
             std::vector<char *> args;
             for (const auto &a : argv)
                 args.push_back(const_cast<char *>(a.c_str()));

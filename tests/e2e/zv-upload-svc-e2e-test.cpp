@@ -66,8 +66,9 @@ class ServiceE2ETest : public ::testing::Test
         }
         return server_.start(dir_.path(), args);
     }
-    // Starts a service process with these launch extras; its log goes to svc.log.
-    Child &start_service(const zv_e2e::Env &extras = kBatch)
+    // Starts a service process with these launch extras (and this open-file limit when above
+    // 0); its log goes to svc.log.
+    Child &start_service(const zv_e2e::Env &extras = kBatch, rlim_t nofile = 0)
     {
         services_.push_back(std::make_unique<Child>());
         Child &svc = *services_.back();
@@ -78,7 +79,7 @@ class ServiceE2ETest : public ::testing::Test
         }
         zv_e2e::Env env = server_.env();
         env.push_back({"ZV_DLOG_FILE", log_path()});
-        EXPECT_TRUE(svc.start(argv, dir_.file("svc.out"), env));
+        EXPECT_TRUE(svc.start(argv, dir_.file("svc.out"), env, nofile));
         return svc;
     }
     std::string log_path() const { return dir_.file("svc.log"); }
@@ -339,6 +340,31 @@ TEST_F(LargeFileE2ETest, VideoPastTwoGiBSurvivesAKillAndArrivesWhole)
     ASSERT_EQ(resumed.size(), 1u);
     EXPECT_GT(resumed[0].range_start(), kTwoGiB);
     EXPECT_EQ(resumed[0].range_start() + resumed[0].body_length, kSize);
+}
+
+// Under an open-file limit of 128 (soft and hard), far below what 200 jobs at once would hold,
+// the batch completes: every copy byte-identical, no descriptor missing anywhere, and the tray
+// ends with the completion alone.
+TEST_F(ServiceE2ETest, BatchPastTheOpenFileLimitCompletes)
+{
+    ASSERT_TRUE(start_server());
+    const int kJobs = 200;
+    std::vector<std::string> files;
+    for (int id = 1; id <= kJobs; id++) {
+        files.push_back(video("v" + std::to_string(id) + ".mp4", 20000, 100 + id));
+        ASSERT_TRUE(zv_upload_test::add_row(id, ZV_UPLOAD_STATUS_READY, 1.7e9 + id,
+                                            files.back().c_str(), "Batch"));
+    }
+    start_service(kBatch, 128);
+    for (int id = 1; id <= kJobs; id++)
+        ASSERT_TRUE(wait_status(id, ZV_UPLOAD_STATUS_COMPLETED)) << id;
+    for (int id = 1; id <= kJobs; id++)
+        expect_identical(id, files[id - 1]);
+    EXPECT_FALSE(logged("Too many open files"));
+    std::string run = dir_.file("run");
+    ASSERT_TRUE(zv_test::wait_for([&] { return notification(run, "zuvo_ongoing_noti").empty(); },
+                                  kLongWaitMs));
+    EXPECT_NE(notification(run, "zuvo_complete_noti")["title"].find("200"), std::string::npos);
 }
 
 // A failure of the server or of the settings: the row ends as expected and the log says why.

@@ -1,6 +1,7 @@
 // Tests of the host notification service against a desktop notification service: a private
 // session bus (tests/CMakeLists.txt runs these under dbus-run-session) with a stand-in
-// org.freedesktop.Notifications in this process that records the calls and clicks.
+// org.freedesktop.Notifications in this process that records the calls and clicks; and tray
+// files written while no descriptor is left.
 #include "notification.h"
 
 #include <Eldbus.h>
@@ -8,6 +9,7 @@
 #include <gtest/gtest.h>
 #include <signal.h>
 #include <stdlib.h>
+#include <sys/resource.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
@@ -226,6 +228,44 @@ TEST_F(DesktopNotificationTest, ClickLaunchesTheApplication)
     kill(app, SIGTERM);
     EXPECT_EQ(zv_test::wait_program(app), 0);
     unsetenv("ZV_PROBE_LOG");
+// A tray file that cannot be written while no descriptor is left is written once they are
+// back; until then its tag is found as posted, and a delete takes it back for good.
+TEST(TrayFile, UnwrittenNotificationLandsLaterUnlessDeleted)
+{
+    zv_test::TempDir dir;
+    auto posted = [&](const char *tag) {
+        return access(dir.file(std::string("run/notifications/") + tag + ".ini").c_str(), F_OK) ==
+               0;
+    };
+    notification_h late = notification_create(NOTIFICATION_TYPE_ONGOING);
+    notification_h gone = notification_create(NOTIFICATION_TYPE_ONGOING);
+    notification_set_tag(late, "late");
+    notification_set_tag(gone, "gone");
+    notification_set_text(late, NOTIFICATION_TEXT_TYPE_TITLE, "Uploading", nullptr,
+                          NOTIFICATION_VARIABLE_TYPE_NONE);
+    rlimit saved;
+    ASSERT_EQ(getrlimit(RLIMIT_NOFILE, &saved), 0);
+    rlimit none = saved;
+    none.rlim_cur = 0;
+    ASSERT_EQ(setrlimit(RLIMIT_NOFILE, &none), 0);
+    int late_rc = notification_post(late), gone_rc = notification_post(gone);
+    ASSERT_EQ(setrlimit(RLIMIT_NOFILE, &saved), 0);
+    EXPECT_EQ(late_rc, NOTIFICATION_ERROR_IO_ERROR);
+    EXPECT_EQ(gone_rc, NOTIFICATION_ERROR_IO_ERROR);
+    EXPECT_FALSE(posted("late"));
+
+    notification_h found = notification_load_by_tag("gone");
+    ASSERT_NE(found, nullptr);
+    EXPECT_EQ(notification_delete(found), NOTIFICATION_ERROR_NONE);
+    notification_free(found);
+    ASSERT_TRUE(wait_for([&] { return posted("late"); }));
+    EXPECT_FALSE(posted("gone")) << "the try that wrote the other one would have written it";
+    notification_h loaded = notification_load_by_tag("late");
+    char *title = nullptr;
+    notification_get_text(loaded, NOTIFICATION_TEXT_TYPE_TITLE, &title);
+    EXPECT_STREQ(title, "Uploading");
+    for (notification_h n : {late, gone, loaded})
+        notification_free(n);
 }
 
 } // namespace

@@ -1,12 +1,15 @@
 // Transfer engine against loopback servers written here: what goes on the wire, how answers
-// come back, pause / resume / cancel, failures, and stopping with requests in flight.
+// come back, pause / resume / cancel, failures, stopping with requests in flight, and an
+// open-file limit that cannot hold every transfer.
 #include <gtest/gtest.h>
 
 #include <arpa/inet.h>
+#include <dirent.h>
 #include <fcntl.h>
 #include <netinet/in.h>
 #include <stdlib.h>
 #include <string.h>
+#include <sys/resource.h>
 #include <sys/socket.h>
 #include <unistd.h>
 
@@ -763,6 +766,74 @@ TEST_F(RunningUploadTest, StopNeverHangsWithRequestsInFlight)
     ASSERT_EQ(zv_curl_init_service(), ZV_CURL_ERROR_NONE);
     server_.set_gated(false);
     run_another_request();
+}
+
+// The descriptors of this process: how many, or how many name `path`.
+int descriptors(const std::string &path = "")
+{
+    int n = 0;
+    DIR *dir = opendir("/proc/self/fd");
+    while (const dirent *entry = dir ? readdir(dir) : nullptr) {
+        char target[4096];
+        std::string link = std::string("/proc/self/fd/") + entry->d_name;
+        ssize_t len = readlink(link.c_str(), target, sizeof target - 1);
+        if (entry->d_name[0] != '.' &&
+            (path.empty() || std::string(target, len > 0 ? len : 0) == path))
+            ++n;
+    }
+    if (dir)
+        closedir(dir);
+    return path.empty() ? n - 1 : n;
+}
+
+// Started under an open-file limit with 40 descriptors to spare, the engine runs at most as
+// many transfers as they can hold (a connection and a file each); the others wait in the
+// engine, and their wait does not count against their time-out. A finished upload keeps no
+// descriptor of its file.
+TEST(EngineFileLimit, TransfersPastTheLimitWaitTheirTurnAndAllComplete)
+{
+    zv_test::TempDir tmp;
+    const int kSpare = 40;
+    rlimit saved;
+    ASSERT_EQ(getrlimit(RLIMIT_NOFILE, &saved), 0);
+    rlimit low = saved;
+    low.rlim_cur = static_cast<rlim_t>(descriptors() + kSpare);
+    ASSERT_EQ(setrlimit(RLIMIT_NOFILE, &low), 0);
+    int started = zv_curl_init_service();
+    setrlimit(RLIMIT_NOFILE, &saved); // the servers of the test need their own descriptors
+    ASSERT_EQ(started, ZV_CURL_ERROR_NONE);
+
+    LoopbackServer held(answer("201 Created"));
+    LoopbackServer fast(answer("200 OK"));
+    held.set_gated(true);
+    std::string path = tmp.file("clip.mp4");
+    ASSERT_TRUE(zv_test::write_file(path, pattern(4096)));
+    const int kHeld = kSpare / 2 + 1, kWaiting = 20;
+    std::vector<Outcome> outcomes(kHeld + kWaiting);
+    std::vector<Item> items(kHeld + kWaiting);
+    for (int i = 0; i < kHeld + kWaiting; ++i) {
+        if (i < kHeld) {
+            prepare_put(items[i], outcomes[i], held.url("/up"), path, 4096, 0);
+        } else {
+            prepare(items[i], outcomes[i], ZV_CURL_HTTP_METHOD_GET, fast.url());
+            zv_curl_set_timeout(items[i].p, 1000);
+        }
+        ASSERT_EQ(zv_curl_send_request(items[i].p), 0);
+    }
+    // Longer than the waiting requests' time-out.
+    std::this_thread::sleep_for(std::chrono::milliseconds(1500));
+    EXPECT_GE(held.connections_, 1);
+    EXPECT_LE(held.connections_, kSpare / 2);
+    EXPECT_EQ(fast.connections_, 0) << "the later requests wait while the held ones run";
+
+    held.set_gated(false);
+    for (int i = 0; i < kHeld + kWaiting; ++i) {
+        ASSERT_TRUE(outcomes[i].wait_answer()) << i;
+        std::lock_guard<std::mutex> lock(outcomes[i].m);
+        EXPECT_EQ(outcomes[i].http_code, i < kHeld ? 201 : 200) << i;
+    }
+    EXPECT_EQ(descriptors(path), 0);
+    zv_curl_finalize_service();
 }
 
 } // namespace

@@ -7,9 +7,11 @@
 #include <Elementary.h>
 #include <app.h>
 #include <efl_extension.h>
+#include <errno.h>
 #include <glib.h>
 #include <stdlib.h>
 #include <string.h>
+#include <sys/resource.h>
 #include <uxt.h>
 
 #include <memory>
@@ -37,6 +39,23 @@ void replace_string(char **field, const char *value)
 {
     free(*field);
     *field = value ? strdup(value) : nullptr;
+}
+
+// Every job of a batch runs at once, each with a connection and, while it sends, its file: the
+// soft open-file limit goes up to the hard limit, so that the transfer engine holds jobs back
+// only when even the hard limit cannot hold them all.
+void raise_open_file_limit()
+{
+    struct rlimit rl;
+    if (getrlimit(RLIMIT_NOFILE, &rl) != 0 || rl.rlim_cur >= rl.rlim_max)
+        return;
+    unsigned long long soft = rl.rlim_cur;
+    rl.rlim_cur = rl.rlim_max;
+    if (setrlimit(RLIMIT_NOFILE, &rl) != 0) {
+        ZV_LOGE("cannot raise the open-file limit from %llu: %s", soft, strerror(errno));
+        return;
+    }
+    ZV_LOGI("open-file limit raised from %llu to %llu", soft, (unsigned long long)rl.rlim_cur);
 }
 
 // "1" or "true" turns the position on for the batch.
@@ -426,6 +445,7 @@ int main(int argc, char *argv[])
 {
     // The one application context; static so that it outlives every callback.
     static AppData ad;
+    raise_open_file_limit();
     ui_app_lifecycle_callback_s event_callback;
     memset(&event_callback, 0, sizeof event_callback);
     event_callback.create = _app_create;

@@ -9,17 +9,28 @@
 // worker then waits, lock released, until no operation is pending, and performs at once
 // with whatever changed. So every libcurl call on the multi handle or an attached easy
 // handle is made with the lock held, and the worker never polls while an operation waits.
+//
+// Open files: a running transfer holds a connection and, while it sends, its upload file.
+// When the open-file limit cannot hold every transfer at once, the engine caps how many run
+// (and the multi handle's connections) and keeps the rest waiting, in the order they were
+// sent, until a running one ends. A transfer's file is closed as soon as it stops running or
+// is paused, and a finished transfer gives back its easy handle at once.
 #include "zv-plugin-curl.h"
 
+#include <dirent.h>
+#include <errno.h>
 #include <glib.h>
+#include <limits.h>
 #include <pthread.h>
 #include <stdint.h>
 #include <string.h>
 #include <strings.h>
+#include <sys/resource.h>
 
 #include <algorithm>
 #include <chrono>
 #include <condition_variable>
+#include <deque>
 #include <memory>
 #include <mutex>
 #include <string>
@@ -39,12 +50,19 @@ constexpr int kMaxWaitMs = 5000;
 constexpr long kUploadBufferSize = 512L * 1024;
 // The longest request body text written to the verbose log.
 constexpr size_t kMaxLoggedBody = 1024;
+// Descriptors of the open-file limit kept for the rest of the process when the engine caps its
+// transfers: the history and its journal, tray and key files, launch connections, the
+// toolkit's files. A quarter of what is free at start, within these bounds.
+constexpr long kMinReserveFds = 16;
+constexpr long kMaxReserveFds = 64;
 
 enum EngineFlag {
     kAttached = 1 << 0, // the easy handle is in the multi handle
     kPaused = 1 << 1,   // paused by zv_curl_pause_request
     kOrphan = 1 << 2,   // released on the worker; freed by the worker at its next safe point
     kOverflow = 1 << 3, // the answer passed ZV_CURL_MAX_RESPONSE_SIZE; its request was aborted
+    kWaiting = 1 << 4,  // sent, waiting in the engine until the cap lets it run
+    kFinished = 1 << 5, // its request completed; the easy handle is released
 };
 
 struct EngineState {
@@ -57,6 +75,8 @@ struct EngineState {
     int waiters = 0;      // main-loop operations waiting for the worker to leave the poll
     std::vector<TransferItem *> attached;
     std::vector<TransferItem *> orphans;
+    size_t max_attached = 0;            // the cap on running transfers; 0: none
+    std::deque<TransferItem *> waiting; // sent while the cap was reached, oldest first
 };
 
 EngineState g_engine;
@@ -141,20 +161,63 @@ void close_stream(TransferItem *item)
     }
 }
 
-// With the lock held, not inside curl_multi_perform: takes the item's handle out of the
-// multi handle and releases the header list it used. The easy handle stays in the item.
+bool cap_reached()
+{
+    return g_engine.max_attached > 0 && g_engine.attached.size() >= g_engine.max_attached;
+}
+
+// With the lock held, not inside curl_multi_perform: the item's handle goes into the multi
+// handle.
+CURLMcode attach(TransferItem *item)
+{
+    CURLMcode mc = curl_multi_add_handle(g_engine.multi, item->curl);
+    if (mc != CURLM_OK)
+        return mc;
+    item->engine_flags = (item->engine_flags & ~kWaiting) | kAttached;
+    g_engine.attached.push_back(item);
+    return CURLM_OK;
+}
+
+// With the lock held, not inside curl_multi_perform: waiting requests run, oldest first, while
+// the cap leaves room. A paused one waits on.
+void start_waiting()
+{
+    auto &queue = g_engine.waiting;
+    for (auto it = queue.begin(); it != queue.end() && !cap_reached() && !g_engine.stopping;) {
+        TransferItem *item = *it;
+        if (item->engine_flags & kPaused) {
+            ++it;
+            continue;
+        }
+        it = queue.erase(it);
+        CURLMcode mc = attach(item);
+        if (mc != CURLM_OK) {
+            // As for a send that libcurl refuses: no answer will come.
+            ZV_LOGE("curl_multi_add_handle Error:: %s", curl_multi_strerror(mc));
+            item->engine_flags &= ~(kWaiting | kPaused);
+        }
+    }
+}
+
+// With the lock held, not inside curl_multi_perform: takes the item's request out of the
+// multi handle (a waiting one out of the queue), closes its file and releases the header list
+// it used; a waiting request takes the freed place. The easy handle stays in the item.
 void detach(TransferItem *item)
 {
-    if (!(item->engine_flags & kAttached))
+    close_stream(item);
+    if (!(item->engine_flags & (kAttached | kWaiting)))
         return;
-    if (g_engine.multi)
+    if ((item->engine_flags & kAttached) && g_engine.multi)
         curl_multi_remove_handle(g_engine.multi, item->curl);
     curl_easy_setopt(item->curl, CURLOPT_HTTPHEADER, NULL);
     curl_slist_free_all(item->engine_headers);
     item->engine_headers = NULL;
-    item->engine_flags &= ~(kAttached | kPaused);
     auto &list = g_engine.attached;
     list.erase(std::remove(list.begin(), list.end(), item), list.end());
+    auto &queue = g_engine.waiting;
+    queue.erase(std::remove(queue.begin(), queue.end(), item), queue.end());
+    item->engine_flags &= ~(kAttached | kWaiting | kPaused);
+    start_waiting();
 }
 
 // With the lock held, not inside curl_multi_perform: the record and its handle go back to
@@ -402,8 +465,10 @@ size_t _zv_curl_read_cb(char *ptr, size_t size, size_t nmemb, void *userp)
         if (!item->file_path)
             return 0;
         item->file_stream = fopen(item->file_path, "rb");
-        if (!item->file_stream)
-            return 0;
+        if (!item->file_stream) {
+            ZV_LOGE("cannot open %s: %s", item->file_path, strerror(errno));
+            return CURL_READFUNC_ABORT;
+        }
     }
     if (fseeko(item->file_stream, static_cast<off_t>(item->file_offset), SEEK_SET) != 0)
         ZV_LOGE("fseek fail");
@@ -532,10 +597,18 @@ void perform_and_report()
         char *priv = NULL;
         curl_easy_getinfo(easy, CURLINFO_PRIVATE, &priv);
         TransferItem *item = reinterpret_cast<TransferItem *>(priv);
-        if (item && item->curl == easy && (item->engine_flags & kAttached))
+        if (item && item->curl == easy && (item->engine_flags & kAttached)) {
+            // The request is over: its connection goes back to the multi handle's cache, its
+            // file is closed, and its easy handle and answer go at once, so that finished
+            // items hold no descriptor and little memory.
             detach(item);
-        else
+            curl_easy_cleanup(item->curl);
+            item->curl = NULL;
+            item->engine_flags |= kFinished;
+            clear_answer(item);
+        } else {
             curl_multi_remove_handle(g_engine.multi, easy);
+        }
     }
 }
 
@@ -586,6 +659,8 @@ void *_zv_curl_thread_loop(void *)
     }
 
     ZV_LOGI("ERR: curl_multi_init is NULL");
+    while (!g_engine.waiting.empty())
+        detach(g_engine.waiting.back());
     while (!g_engine.attached.empty())
         detach(g_engine.attached.back());
     reclaim_orphans();
@@ -609,7 +684,7 @@ int check_sent_item(TransferItem *item)
         ZV_LOGE("url is NULL");
         return ZV_CURL_ERROR_INVALID_PARAMETER;
     }
-    if (!item->curl) {
+    if (!item->curl && !(item->engine_flags & kFinished)) {
         ZV_LOGE("curl is NULL");
         return ZV_CURL_ERROR_INVALID_PARAMETER;
     }
@@ -624,13 +699,19 @@ int set_pause(TransferItem *item, bool pause)
     if (refused_on_worker())
         return ZV_CURL_ERROR_OPERATION_FAILED;
     EngineLock lock;
-    // A request that is no longer attached has nothing left to pause.
-    if (item->engine_flags & kAttached) {
+    // A request that is no longer attached or waiting has nothing left to pause; a waiting one
+    // that is paused keeps its place without running.
+    if (item->engine_flags & kAttached)
         curl_easy_pause(item->curl, pause ? CURLPAUSE_ALL : CURLPAUSE_CONT);
-        if (pause)
+    if (item->engine_flags & (kAttached | kWaiting)) {
+        if (pause) {
             item->engine_flags |= kPaused;
-        else
+            // The next read opens the file again at the offset it has reached.
+            close_stream(item);
+        } else {
             item->engine_flags &= ~kPaused;
+            start_waiting();
+        }
     }
     return ZV_CURL_ERROR_NONE;
 }
@@ -731,6 +812,38 @@ CURL *build_easy_handle(TransferItem *item, SlistPtr *headers)
     return curl.release();
 }
 
+// The descriptors the process holds now; -1 when it cannot tell.
+long open_descriptors()
+{
+    DIR *dir = opendir("/proc/self/fd");
+    if (!dir)
+        return -1;
+    long n = 0;
+    while (const dirent *entry = readdir(dir)) {
+        if (entry->d_name[0] != '.')
+            ++n;
+    }
+    closedir(dir);
+    return n - 1; // the listing's own
+}
+
+// How many transfers may run at once under the open-file limit; 0 when the limit is none.
+// A running transfer holds up to two descriptors (its connection and its file, or the
+// resolver's pair and then the connection); the reserve stays for the rest of the process.
+size_t transfer_cap()
+{
+    struct rlimit rl;
+    if (getrlimit(RLIMIT_NOFILE, &rl) != 0 || rl.rlim_cur == RLIM_INFINITY)
+        return 0;
+    long limit = static_cast<long>(std::min<rlim_t>(rl.rlim_cur, LONG_MAX));
+    long in_use = open_descriptors();
+    long spare = limit - (in_use < 0 ? kMaxReserveFds : in_use);
+    long reserve = std::clamp(spare / 4, kMinReserveFds, kMaxReserveFds);
+    long cap = std::max(1L, (spare - reserve) / 2);
+    ZV_LOGI("open-file limit %ld, %ld in use: at most %ld transfers at once", limit, in_use, cap);
+    return static_cast<size_t>(cap);
+}
+
 } // namespace
 
 int zv_curl_init_service(void)
@@ -746,6 +859,10 @@ int zv_curl_init_service(void)
         ZV_LOGE("ERR: curl_multi_init fail");
         return ZV_CURL_ERROR_OPERATION_FAILED;
     }
+    g_engine.max_attached = transfer_cap();
+    if (g_engine.max_attached > 0)
+        curl_multi_setopt(g_engine.multi, CURLMOPT_MAX_TOTAL_CONNECTIONS,
+                          static_cast<long>(g_engine.max_attached));
     // A start that fails after this point leaves nothing behind.
     auto fail = [&] {
         curl_multi_cleanup(g_engine.multi);
@@ -812,7 +929,7 @@ int zv_curl_send_request(TransferItem *item)
     if (refused_on_worker())
         return ZV_CURL_ERROR_OPERATION_FAILED;
 
-    if (item->curl) {
+    if (item->curl || item->engine_flags) {
         // The item was sent before: its old transfer leaves the engine, and the answer and
         // file position it left behind are dropped.
         EngineLock lock;
@@ -833,8 +950,11 @@ int zv_curl_send_request(TransferItem *item)
 
     EngineLock lock;
     item->curl = curl.release();
-    CURLMcode mc = g_engine.worker_running ? curl_multi_add_handle(g_engine.multi, item->curl)
-                                           : CURLM_BAD_HANDLE;
+    // Past the cap, or behind requests that already wait, the request waits its turn.
+    bool waits = g_engine.worker_running && (cap_reached() || !g_engine.waiting.empty());
+    CURLMcode mc = CURLM_BAD_HANDLE;
+    if (g_engine.worker_running)
+        mc = waits ? CURLM_OK : attach(item);
     if (mc != CURLM_OK) {
         // Not queued, so no answer will come: the caller is told, so that it does not wait
         // for one (an engine that failed to start refuses every request this way).
@@ -843,8 +963,10 @@ int zv_curl_send_request(TransferItem *item)
         return ZV_CURL_ERROR_OPERATION_FAILED;
     }
     item->engine_headers = headers.release();
-    item->engine_flags = kAttached;
-    g_engine.attached.push_back(item);
+    if (waits) {
+        item->engine_flags = kWaiting;
+        g_engine.waiting.push_back(item);
+    }
     return ZV_CURL_ERROR_NONE;
 }
 

@@ -17,6 +17,13 @@
 //   not send, cancel, pause, resume or stop: those refuse on the worker thread with
 //   ZV_CURL_ERROR_OPERATION_FAILED and log why.
 //
+// Open files: every sent request belongs to the one multi handle. When the process's open-file
+// limit cannot hold every transfer, at most as many run at once as it can hold (the multi
+// handle's connections are capped likewise); the others wait inside the engine, in the order
+// they were sent, and start as running ones end. An upload holds its file only while its
+// transfer runs unpaused, and a completed request releases its easy handle, its file and its
+// collected answer as soon as its response callback has returned.
+//
 // Ownership: the item record is the caller's. zv_curl_free empties it (the record stays
 // valid); zv_curl_delete cancels its transfer, empties it and returns the record and its
 // easy handle to the allocator; zv_curl_new on a pointer that holds an item does the same
@@ -74,7 +81,7 @@ typedef void (*ZvCurlProgressCb)(int percent, void *user_data, int64_t file_size
 
 // One HTTP request. Made zero-filled by zv_curl_new; fill it with the setters only.
 struct TransferItem {
-    CURL *curl; // made by zv_curl_send_request; kept after completion until resent or deleted
+    CURL *curl; // made by zv_curl_send_request; released when the request completes
     ZvCurlResponseCb callback_func;
     ZvCurlProgressCb progress_cb_func;
     void *user_data; // handed back to both callbacks; not owned
@@ -86,7 +93,7 @@ struct TransferItem {
     int timeout;         // whole request, ms; 0 keeps the library default
     int connect_timeout; // connection phase, ms; 0 keeps the library default
     char *user_agent;
-    FILE *file_stream; // the upload file, opened by the first read
+    FILE *file_stream; // the upload file, opened by the first read, closed when the transfer stops
     char *file_path;   // the file whose bytes are the body of a PUT
     int64_t file_size; // 64-bit: videos pass 2 GiB
     int64_t file_offset;    // next byte of the file to send; advanced by every read
