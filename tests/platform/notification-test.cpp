@@ -228,6 +228,8 @@ TEST_F(DesktopNotificationTest, ClickLaunchesTheApplication)
     kill(app, SIGTERM);
     EXPECT_EQ(zv_test::wait_program(app), 0);
     unsetenv("ZV_PROBE_LOG");
+}
+
 // A tray file that cannot be written while no descriptor is left is written once they are
 // back; until then its tag is found as posted, and a delete takes it back for good.
 TEST(TrayFile, UnwrittenNotificationLandsLaterUnlessDeleted)
