@@ -182,8 +182,10 @@ CURLMcode attach(TransferItem *item)
 // the cap leaves room. A paused one waits on.
 void start_waiting()
 {
+    if (!g_engine.multi || g_engine.stopping)
+        return;
     auto &queue = g_engine.waiting;
-    for (auto it = queue.begin(); it != queue.end() && !cap_reached() && !g_engine.stopping;) {
+    for (auto it = queue.begin(); it != queue.end() && !cap_reached();) {
         TransferItem *item = *it;
         if (item->engine_flags & kPaused) {
             ++it;
