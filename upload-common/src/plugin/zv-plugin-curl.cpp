@@ -182,8 +182,10 @@ CURLMcode attach(TransferItem *item)
 // the cap leaves room. A paused one waits on.
 void start_waiting()
 {
+    if (!g_engine.multi || g_engine.stopping)
+        return;
     auto &queue = g_engine.waiting;
-    for (auto it = queue.begin(); it != queue.end() && !cap_reached() && !g_engine.stopping;) {
+    for (auto it = queue.begin(); it != queue.end() && !cap_reached();) {
         TransferItem *item = *it;
         if (item->engine_flags & kPaused) {
             ++it;
@@ -673,8 +675,10 @@ void *_zv_curl_thread_loop(void *)
     return NULL;
 }
 
-// The checks shared by cancel, pause and resume.
-int check_sent_item(TransferItem *item)
+// The checks shared by cancel, pause and resume, then the engine lock for them: a request
+// that completes gives up its easy handle on the worker, so whether the item was sent is
+// read with the lock held.
+int lock_sent_item(TransferItem *item, std::unique_ptr<EngineLock> *lock)
 {
     if (!item) {
         ZV_LOGE("handle is NULL");
@@ -684,6 +688,9 @@ int check_sent_item(TransferItem *item)
         ZV_LOGE("url is NULL");
         return ZV_CURL_ERROR_INVALID_PARAMETER;
     }
+    if (refused_on_worker())
+        return ZV_CURL_ERROR_OPERATION_FAILED;
+    lock->reset(new EngineLock);
     if (!item->curl && !(item->engine_flags & kFinished)) {
         ZV_LOGE("curl is NULL");
         return ZV_CURL_ERROR_INVALID_PARAMETER;
@@ -693,12 +700,10 @@ int check_sent_item(TransferItem *item)
 
 int set_pause(TransferItem *item, bool pause)
 {
-    int ret = check_sent_item(item);
+    std::unique_ptr<EngineLock> lock;
+    int ret = lock_sent_item(item, &lock);
     if (ret != ZV_CURL_ERROR_NONE)
         return ret;
-    if (refused_on_worker())
-        return ZV_CURL_ERROR_OPERATION_FAILED;
-    EngineLock lock;
     // A request that is no longer attached or waiting has nothing left to pause; a waiting one
     // that is paused keeps its place without running.
     if (item->engine_flags & kAttached)
@@ -716,7 +721,7 @@ int set_pause(TransferItem *item, bool pause)
     return ZV_CURL_ERROR_NONE;
 }
 
-// Builds the request's easy handle; the handle is not attached yet, so no lock is needed.
+// Builds the request's easy handle (not attached yet) from the item, with the lock held.
 CURL *build_easy_handle(TransferItem *item, SlistPtr *headers)
 {
     EasyPtr curl(curl_easy_init());
@@ -929,10 +934,12 @@ int zv_curl_send_request(TransferItem *item)
     if (refused_on_worker())
         return ZV_CURL_ERROR_OPERATION_FAILED;
 
+    // The worker gives up a completed request's easy handle and writes the file offset while
+    // it reads: the item is looked at with the lock held.
+    EngineLock lock;
     if (item->curl || item->engine_flags) {
         // The item was sent before: its old transfer leaves the engine, and the answer and
         // file position it left behind are dropped.
-        EngineLock lock;
         detach(item);
         curl_easy_cleanup(item->curl);
         item->curl = NULL;
@@ -940,15 +947,12 @@ int zv_curl_send_request(TransferItem *item)
         clear_answer(item);
         close_stream(item);
     }
-
     SlistPtr headers;
     EasyPtr curl(build_easy_handle(item, &headers));
     if (!curl) {
         ZV_LOGE("curl init fail");
         return ZV_CURL_ERROR_OPERATION_FAILED;
     }
-
-    EngineLock lock;
     item->curl = curl.release();
     // Past the cap, or behind requests that already wait, the request waits its turn.
     bool waits = g_engine.worker_running && (cap_reached() || !g_engine.waiting.empty());
@@ -973,12 +977,10 @@ int zv_curl_send_request(TransferItem *item)
 int zv_curl_cancel_request(TransferItem *item)
 {
     ZV_LOG_ENTER();
-    int ret = check_sent_item(item);
+    std::unique_ptr<EngineLock> lock;
+    int ret = lock_sent_item(item, &lock);
     if (ret != ZV_CURL_ERROR_NONE)
         return ret;
-    if (refused_on_worker())
-        return ZV_CURL_ERROR_OPERATION_FAILED;
-    EngineLock lock;
     detach(item);
     curl_easy_cleanup(item->curl);
     item->curl = NULL;
