@@ -356,10 +356,23 @@ TEST_F(ServiceE2ETest, BatchPastTheOpenFileLimitCompletes)
                                             files.back().c_str(), "Batch"));
     }
     start_service(kBatch, 128);
-    for (int id = 1; id <= kJobs; id++)
-        ASSERT_TRUE(wait_status(id, ZV_UPLOAD_STATUS_COMPLETED)) << id;
-    for (int id = 1; id <= kJobs; id++)
-        expect_identical(id, files[id - 1]);
+    std::map<int, zv_upload_test::StoredRow> rows;
+    auto all_completed = [&] {
+        rows = stored_rows();
+        for (int id = 1; id <= kJobs; id++)
+            if (rows[id].status != ZV_UPLOAD_STATUS_COMPLETED)
+                return false;
+        return true;
+    };
+    ASSERT_TRUE(zv_test::wait_for(all_completed, 4 * kLongWaitMs));
+    std::map<std::string, Upload> by_url;
+    for (const Upload &u : server_.uploads())
+        by_url[u.url] = u;
+    for (int id = 1; id <= kJobs; id++) {
+        const Upload &u = by_url[rows[id].url];
+        ASSERT_TRUE(u.complete) << id;
+        EXPECT_TRUE(zv_test::read_file(u.path) == contents_[files[id - 1]]) << id;
+    }
     EXPECT_FALSE(logged("Too many open files"));
     std::string run = dir_.file("run");
     ASSERT_TRUE(zv_test::wait_for([&] { return notification(run, "zuvo_ongoing_noti").empty(); },
