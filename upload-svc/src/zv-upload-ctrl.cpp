@@ -985,6 +985,11 @@ void _zv_upload_ctrl_pipe_complete_cb(void *data, void *buf, unsigned int nbyte)
     zv_upload_ctrl_post_notification(ad, job_item);
 
     if (!ad->is_paused) {
+        // The last progress message may be read after this one (the pipes keep no order
+        // between them): the bar ends where the upload did.
+        double value = job_item->percent / 100.0;
+        set_bar_value(job_item->gen_item, value);
+        set_bar_value(job_item->edit_gen_item, value);
         zv_upload_list_complete_item(job_item);
         if (zv_ext_db_get_active_count() <= 0)
             ZV_LOGI("No more upload item");
