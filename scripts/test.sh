@@ -40,7 +40,7 @@ status=0
 run_suite() {
   local name=$1 dir=$2
   shift 2
-  local log="$ZV_REPORT_DIR/$dir.log" start=$SECONDS rc=0
+  local log="$ZV_REPORT_DIR/$dir${ZV_LOG_SUFFIX:-}.log" start=$SECONDS rc=0
   ctest --test-dir "$dir" --output-on-failure -j2 --timeout 600 "$@" >"$log" 2>&1 || rc=$?
   # The summary and what went wrong; the whole output stays in the log.
   grep -a -E '\*\*\*|tests passed|Failure|ERROR: |WARNING: ThreadSanitizer|runtime error|CMake Error' \
@@ -96,12 +96,13 @@ if [[ " $stages " == *" tsan "* ]]; then
   cmake --build build-tsan -j"$jobs" --target zv-plugin-curl-test zv-plugin-main-test \
     zv-upload-ctrl-test zv-upload-list-test zv-upload-ctrl-e2e-test zv-upload-svc-e2e-test \
     zuvo-upload-svc zuvo-devserver zuvo-client zv-vconf zv-keystore zv_resources
+  export ZV_COMPANION_TSAN_OPTIONS="halt_on_error=1:suppressions=$top/tests/sanitizers/tsan-companion.supp"
   TSAN_OPTIONS="halt_on_error=1:second_deadlock_stack=1:suppressions=$top/tests/sanitizers/tsan.supp" \
     run_suite "thread: engine, client, controller" build-tsan \
     -R '^(Engine|ClientTest|AccountTest|CategoryListTest|RunningUploadTest|UploadCtrlTest|UploadListTest|CtrlE2ETest|ServiceE2ETest|Failures/ServiceFailureTest)'
   # The stress test again with two more seeds (each run prints its seed in the report).
   for seed in ${ZV_STRESS_SEEDS:-7 4242}; do
-    ZV_STRESS_SEED=$seed \
+    ZV_STRESS_SEED=$seed ZV_LOG_SUFFIX="-stress-$seed" \
     TSAN_OPTIONS="halt_on_error=1:second_deadlock_stack=1:suppressions=$top/tests/sanitizers/tsan.supp" \
       run_suite "thread: stress, seed $seed" build-tsan -R 'CtrlE2ETest.Stress'
   done

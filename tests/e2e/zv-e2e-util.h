@@ -387,6 +387,9 @@ inline std::string make_video(const std::string &path, size_t bytes, unsigned se
 inline std::vector<int> record(const std::vector<std::string> &files, const std::string &title)
 {
     std::vector<std::string> argv = {zv_test::bin_path("zuvo-client"), "add"};
+    // Under ThreadSanitizer the companion has suppressions of its own (its media libraries).
+    if (const char *opts = getenv("ZV_COMPANION_TSAN_OPTIONS"))
+        argv.insert(argv.begin(), {"/usr/bin/env", std::string("TSAN_OPTIONS=") + opts});
     argv.insert(argv.end(), files.begin(), files.end());
     argv.push_back("--title");
     argv.push_back(title);
