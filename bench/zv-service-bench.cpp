@@ -21,6 +21,7 @@
 #include <sys/stat.h>
 
 #include <fstream>
+#include <functional>
 #include <map>
 #include <random>
 #include <sstream>
@@ -500,9 +501,18 @@ bool bench_many_jobs(const std::string &root, int jobs, int job_mib)
     return pass;
 }
 
-// Records the files as READY rows titled "job-N" straight into the history (the companion
-// would make a thumbnail of each, minutes for thousands of files).
-bool record_rows(const std::vector<std::string> &files)
+// One history row written straight into the history.
+struct BenchRow {
+    std::string title;
+    std::string file;
+    int64_t size;
+    int percent;
+    int status;
+};
+
+// Writes rows 1..count, row(i) giving each, into the history in one transaction (the store
+// makes the database as the service expects it first).
+bool insert_rows(int count, const std::function<BenchRow(int)> &row)
 {
     if (!zv_ext_db_open())
         return false;
@@ -514,17 +524,18 @@ bool record_rows(const std::vector<std::string> &files)
     sqlite3_stmt *stmt = nullptr;
     sqlite3_prepare_v2(db,
                        "insert into history (historyid, title, filename, filesize, url, percent, "
-                       "status, userid, date) values (?, ?, ?, ?, '', 0, 0, 'bench', ?)",
+                       "status, userid, date) values (?, ?, ?, ?, '', ?, ?, 'bench', ?)",
                        -1, &stmt, nullptr);
     bool ok = stmt != nullptr;
-    for (size_t i = 0; ok && i < files.size(); ++i) {
-        struct stat st;
-        std::string title = "job-" + std::to_string(i + 1);
-        sqlite3_bind_int(stmt, 1, static_cast<int>(i + 1));
-        sqlite3_bind_text(stmt, 2, title.c_str(), -1, SQLITE_TRANSIENT);
-        sqlite3_bind_text(stmt, 3, files[i].c_str(), -1, SQLITE_TRANSIENT);
-        sqlite3_bind_int64(stmt, 4, stat(files[i].c_str(), &st) == 0 ? st.st_size : 0);
-        sqlite3_bind_double(stmt, 5, 1.7e9 + static_cast<double>(i));
+    for (int i = 1; ok && i <= count; ++i) {
+        BenchRow r = row(i);
+        sqlite3_bind_int(stmt, 1, i);
+        sqlite3_bind_text(stmt, 2, r.title.c_str(), -1, SQLITE_TRANSIENT);
+        sqlite3_bind_text(stmt, 3, r.file.c_str(), -1, SQLITE_TRANSIENT);
+        sqlite3_bind_int64(stmt, 4, r.size);
+        sqlite3_bind_int(stmt, 5, r.percent);
+        sqlite3_bind_int(stmt, 6, r.status);
+        sqlite3_bind_double(stmt, 7, 1.7e9 + i);
         ok = sqlite3_step(stmt) == SQLITE_DONE;
         sqlite3_reset(stmt);
     }
@@ -532,6 +543,18 @@ bool record_rows(const std::vector<std::string> &files)
     ok = sqlite3_exec(db, "commit", nullptr, nullptr, nullptr) == SQLITE_OK && ok;
     sqlite3_close(db);
     return ok;
+}
+
+// Records the files as READY rows titled "job-N" straight into the history (the companion
+// would make a thumbnail of each, minutes for thousands of files).
+bool record_rows(const std::vector<std::string> &files)
+{
+    return insert_rows(static_cast<int>(files.size()), [&files](int i) {
+        struct stat st;
+        const std::string &file = files[i - 1];
+        int64_t size = stat(file.c_str(), &st) == 0 ? st.st_size : 0;
+        return BenchRow{"job-" + std::to_string(i), file, size, 0, 0};
+    });
 }
 
 // A batch of the history's size on a normal machine's open-file limit: the service alone
@@ -584,31 +607,13 @@ bool bench_startup(const std::string &root, int rows)
 
     std::string files_dir = world.dir + "/videos";
     mkdir(files_dir.c_str(), 0700);
-    // The store makes the database as the service expects it; the rows go in at once.
-    if (!zv_ext_db_open())
-        return false;
-    zv_ext_db_close();
-    sqlite3 *db = nullptr;
-    if (sqlite3_open(getenv("ZV_HISTORY_DB"), &db) != SQLITE_OK)
-        return false;
-    sqlite3_exec(db, "begin", nullptr, nullptr, nullptr);
-    sqlite3_stmt *stmt = nullptr;
-    sqlite3_prepare_v2(db,
-                       "insert into history (historyid, title, filename, filesize, url, percent, "
-                       "status, userid, date) values (?, ?, ?, 1048576, '', 100, 4, 'bench', ?)",
-                       -1, &stmt, nullptr);
+    // The rows go in at once, each with its (empty) file and a thumbnail of its own.
     media_content_connect();
-    for (int i = 1; i <= rows; ++i) {
+    bool ok = insert_rows(rows, [&](int i) {
         std::string file = files_dir + "/VID_" + std::to_string(i) + ".mp4";
         if (FILE *f = fopen(file.c_str(), "wb"))
             fclose(f);
         std::string title = "Video " + std::to_string(i);
-        sqlite3_bind_int(stmt, 1, i);
-        sqlite3_bind_text(stmt, 2, title.c_str(), -1, SQLITE_TRANSIENT);
-        sqlite3_bind_text(stmt, 3, file.c_str(), -1, SQLITE_TRANSIENT);
-        sqlite3_bind_double(stmt, 4, 1.7e9 + i);
-        sqlite3_step(stmt);
-        sqlite3_reset(stmt);
         std::string own_thumb;
         if (thumb) {
             own_thumb = files_dir + "/thumb-" + std::to_string(i) + ".png";
@@ -617,12 +622,12 @@ bool bench_startup(const std::string &root, int rows)
         }
         media_content_register_file(file.c_str(), MEDIA_CONTENT_TYPE_VIDEO,
                                     thumb ? own_thumb.c_str() : nullptr, title.c_str());
-    }
+        return BenchRow{title, file, 1048576, 100, 4};
+    });
     media_content_disconnect();
-    sqlite3_finalize(stmt);
-    sqlite3_exec(db, "commit", nullptr, nullptr, nullptr);
-    sqlite3_close(db);
     free(thumb);
+    if (!ok)
+        return false;
 
     // From the start of the process to the log line of the first frame that shows the list.
     std::vector<double> times;

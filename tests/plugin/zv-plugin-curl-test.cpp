@@ -46,16 +46,9 @@ class LoopbackServer
     explicit LoopbackServer(std::function<std::string()> responder)
         : responder_(std::move(responder))
     {
-        listen_fd_ = socket(AF_INET, SOCK_STREAM | SOCK_CLOEXEC, 0);
-        sockaddr_in addr{};
-        addr.sin_family = AF_INET;
-        addr.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
-        socklen_t len = sizeof addr;
-        if (bind(listen_fd_, reinterpret_cast<sockaddr *>(&addr), len) != 0 ||
-            listen(listen_fd_, 16) != 0 ||
-            getsockname(listen_fd_, reinterpret_cast<sockaddr *>(&addr), &len) != 0)
+        listen_fd_ = zv_test::listen_loopback(&port_, 16);
+        if (listen_fd_ < 0)
             ADD_FAILURE() << "loopback server: " << strerror(errno);
-        port_ = ntohs(addr.sin_port);
         acceptor_ = std::thread([this] {
             int fd;
             while ((fd = accept4(listen_fd_, nullptr, nullptr, SOCK_CLOEXEC)) >= 0) {

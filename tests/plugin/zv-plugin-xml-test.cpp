@@ -115,14 +115,7 @@ class DocumentServer {
 public:
     explicit DocumentServer(std::map<std::string, std::string> docs) : docs_(std::move(docs))
     {
-        fd_ = socket(AF_INET, SOCK_STREAM | SOCK_CLOEXEC, 0);
-        sockaddr_in addr = {};
-        addr.sin_family = AF_INET;
-        addr.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
-        socklen_t len = sizeof addr;
-        if (bind(fd_, reinterpret_cast<sockaddr *>(&addr), len) == 0 && listen(fd_, 8) == 0 &&
-            getsockname(fd_, reinterpret_cast<sockaddr *>(&addr), &len) == 0)
-            port_ = ntohs(addr.sin_port);
+        fd_ = zv_test::listen_loopback(&port_);
         thread_ = std::thread([this] { serve(); });
     }
     ~DocumentServer()

@@ -1,5 +1,9 @@
 #include "zv-test-util.h"
 
+#include <arpa/inet.h>
+#include <netinet/in.h>
+#include <sys/socket.h>
+
 #include <Ecore.h>
 #include <fcntl.h>
 #include <stdlib.h>
@@ -153,6 +157,23 @@ std::string LogFile::since_mark() const
 {
     std::string all = read_file(path_);
     return all.size() > mark_ ? all.substr(mark_) : std::string();
+}
+
+int listen_loopback(int *port, int backlog)
+{
+    int fd = socket(AF_INET, SOCK_STREAM | SOCK_CLOEXEC, 0);
+    sockaddr_in addr = {};
+    addr.sin_family = AF_INET;
+    addr.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
+    socklen_t len = sizeof addr;
+    if (fd < 0 || bind(fd, reinterpret_cast<sockaddr *>(&addr), len) != 0 ||
+        listen(fd, backlog) != 0 || getsockname(fd, reinterpret_cast<sockaddr *>(&addr), &len) != 0) {
+        if (fd >= 0)
+            close(fd);
+        return -1;
+    }
+    *port = ntohs(addr.sin_port);
+    return fd;
 }
 
 } // namespace zv_test

@@ -39,6 +39,10 @@ std::string source_path(const std::string &rel);
 int run_program(const std::vector<std::string> &argv, const std::string &input = "",
                 std::string *out = nullptr);
 
+// A listening TCP socket on 127.0.0.1 with a port of the system's choosing; -1 on failure.
+// *port receives the port.
+int listen_loopback(int *port, int backlog = 8);
+
 std::string read_file(const std::string &path);
 bool write_file(const std::string &path, const std::string &data);
 

@@ -4,12 +4,9 @@
 // host points at a closed local port, so nothing leaves the machine.
 #include "zv-upload-ctrl.h"
 
-#include <arpa/inet.h>
 #include <fcntl.h>
 #include <gtest/gtest.h>
-#include <netinet/in.h>
 #include <sqlite3.h>
-#include <sys/socket.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
@@ -30,14 +27,9 @@ class SilentServer
   public:
     SilentServer()
     {
-        fd_ = socket(AF_INET, SOCK_STREAM | SOCK_CLOEXEC, 0);
-        sockaddr_in addr = {};
-        addr.sin_family = AF_INET;
-        addr.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
-        socklen_t len = sizeof addr;
-        if (bind(fd_, reinterpret_cast<sockaddr *>(&addr), len) == 0 && listen(fd_, 64) == 0 &&
-            getsockname(fd_, reinterpret_cast<sockaddr *>(&addr), &len) == 0)
-            host_ = "127.0.0.1:" + std::to_string(ntohs(addr.sin_port));
+        int port = 0;
+        fd_ = zv_test::listen_loopback(&port, 64);
+        host_ = "127.0.0.1:" + std::to_string(port);
     }
     ~SilentServer() { close(fd_); }
     const std::string &host() const { return host_; }

@@ -54,7 +54,7 @@ struct JobState {
     int status = 0;
     int percent = 0;
     int64_t offset = 0;    // 64-bit, as the job's: videos pass 2 GiB
-    int64_t filesize = -1; // of the job's file when its request was made; -1: unknown
+    int64_t filesize = -1; // of the job's file when its status query was made; -1: unknown
     bool has_url = false;
     std::string url;
     std::string title;
@@ -74,6 +74,8 @@ struct CtrlState {
     CtrlPipe pipes[PIPE_COUNT];
     std::mutex lock; // guards jobs; held briefly, never across a call into the client
     std::unordered_map<const UploadItem *, JobState> jobs;
+    // The job of each current request, for the worker's lookups (one per progress report).
+    std::unordered_map<const ServiceRequest *, JobState *> by_request;
     std::unordered_map<UploadItem *, Ecore_Idler *> idlers; // main loop only
 };
 
@@ -131,11 +133,8 @@ void close_pipe(PipeKind kind)
 // Worker: the state of the job whose current request is handle. g_ctrl.lock must be held.
 JobState *state_of_request(const ServiceRequest *handle)
 {
-    for (auto &entry : g_ctrl.jobs) {
-        if (entry.second.handle == handle)
-            return &entry.second;
-    }
-    return nullptr;
+    auto it = g_ctrl.by_request.find(handle);
+    return it == g_ctrl.by_request.end() ? nullptr : it->second;
 }
 
 // Main loop: the job's state, made from the job when it has none yet. g_ctrl.lock held.
@@ -230,10 +229,11 @@ ServiceRequest *renew_request(UploadItem *job_item)
             zv_request_free(fresh);
             return nullptr;
         }
+        g_ctrl.by_request.erase(v.handle);
+        g_ctrl.by_request[fresh] = &v;
         v.handle = fresh;
         v.in_flight = false;
         v.upload_due = false;
-        v.filesize = file_size_of(job_item->filename);
     }
     job_item->handle = fresh;
     if (former)
@@ -246,7 +246,11 @@ void release_request(UploadItem *job_item)
 {
     {
         std::lock_guard<std::mutex> guard(g_ctrl.lock);
-        g_ctrl.jobs.erase(job_item);
+        auto it = g_ctrl.jobs.find(job_item);
+        if (it != g_ctrl.jobs.end()) {
+            g_ctrl.by_request.erase(it->second.handle);
+            g_ctrl.jobs.erase(it);
+        }
     }
     if (job_item->handle) {
         zv_request_free(job_item->handle);
@@ -1079,11 +1083,14 @@ void _zv_upload_ctrl_resume_upload(AppData *ad, UploadItem *job_item)
         // UPLOADING before the query is queued, not after: an answer that comes at once (a
         // refused connection) then moves the job on from UPLOADING, and nothing here
         // overwrites it.
+        // The query's answer is checked against the file as it is now.
+        int64_t filesize = file_size_of(job_item->filename);
         {
             std::lock_guard<std::mutex> guard(g_ctrl.lock);
             JobState &v = state_of(job_item);
             v.status = ZV_UPLOAD_STATUS_UPLOADING;
             v.in_flight = true;
+            v.filesize = filesize;
         }
         job_item->status = ZV_UPLOAD_STATUS_UPLOADING;
         ret = zv_request_upload_query(handle);
