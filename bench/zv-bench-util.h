@@ -195,16 +195,6 @@ struct Target {
     }
 };
 
-// Removes the uploads a devserver stored (nothing without a storage folder).
-inline void drop_stored(const std::string &storage)
-{
-    if (storage.empty())
-        return;
-    std::string cmd = "rm -f '" + storage + "'/*.data";
-    if (system(cmd.c_str()) != 0)
-        fprintf(stderr, "could not empty %s\n", storage.c_str());
-}
-
 struct RunResult {
     double wall = 0, cpu = 0;
     bool ok = false;
@@ -246,7 +236,8 @@ inline RunResult curl_upload(Target &target, const std::string &path)
     if (pid == 0) {
         int null_fd = open("/dev/null", O_WRONLY);
         dup2(null_fd, STDOUT_FILENO);
-        execlp("curl", "curl", "-sS", "-o", "/dev/null", "-T", path.c_str(), url.c_str(),
+        // --fail: an error answer is a failed round, never a fast one.
+        execlp("curl", "curl", "-sS", "--fail", "-o", "/dev/null", "-T", path.c_str(), url.c_str(),
                (char *)nullptr);
         _exit(127);
     }
@@ -265,9 +256,24 @@ inline double median(std::vector<double> v)
     return v.empty() ? 0 : v[v.size() / 2];
 }
 
+// Figures that missed their target in this run, and whether a miss only prints (--no-fail).
+inline int g_misses = 0;
+inline bool g_no_fail = false;
+
 inline void report(const char *name, const std::string &figure, const char *target, bool pass)
 {
     printf("%-34s %-44s target %-14s %s\n", name, figure.c_str(), target, pass ? "PASS" : "MISS");
+    if (!pass)
+        ++g_misses;
+}
+
+// The program's exit status: 1 when a figure missed its target (or a run failed) unless
+// --no-fail was given.
+inline int finish(bool all_met)
+{
+    all_met = all_met && g_misses == 0;
+    printf("%s\n", all_met ? "all figures met" : "some figures missed");
+    return all_met || g_no_fail ? 0 : 1;
 }
 
 inline std::string fmt(const char *f, double a, double b = 0, double c = 0)

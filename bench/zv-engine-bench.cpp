@@ -4,13 +4,15 @@
 // large upload and over many requests. Prints each figure with its target.
 //
 //   zv-engine-bench [--size-mib N] [--rounds N] [--requests N] [--devserver PATH] [--load]
+//                   [--no-fail]
 //   zv-engine-bench --sink          (the sink server: prints its port, reads and discards)
 //
 // The server is zuvo-devserver when --devserver names it (an upload address is made for each
 // upload with the metadata POST), else the sink of this program, run as a child process so
 // that its CPU is not counted as the engine's. --load runs the uploads beside a busy machine:
 // one process that keeps a core busy and one that keeps writing and removing small files,
-// as a phone's other applications would.
+// as a phone's other applications would. The exit status is 1 when a figure misses its
+// target, unless --no-fail.
 #include <arpa/inet.h>
 #include <fcntl.h>
 #include <netinet/in.h>
@@ -210,6 +212,8 @@ int main(int argc, char **argv)
             devserver = argv[++i];
         else if (a == "--load")
             load = true;
+        else if (a == "--no-fail")
+            g_no_fail = true;
         else {
             fprintf(stderr, "zv-engine-bench: unknown argument %s\n", argv[i]);
             return 2;
@@ -248,15 +252,15 @@ int main(int argc, char **argv)
     Target target;
     int port = 0;
     pid_t server;
-    // The devserver keeps what it receives; in memory (and removed after each upload) its
-    // disk does not become the figure.
-    std::string storage;
+    // The devserver reads every byte through its HTTP stack but stores none: on a virtual
+    // machine that hands freed memory back to its host, 1 GiB stored and removed per upload
+    // costs a varying number of host page faults on the next one, which made one round of
+    // five (engine's or curl's alike) up to four times slower than the others.
     if (!devserver.empty()) {
         target.devserver = true;
-        char shm[] = "/dev/shm/zv-engine-bench-XXXXXX";
-        storage = mkdtemp(shm) ? shm : dir + "/storage";
-        server = spawn_server({devserver, "--port", "0", "--storage", storage, "--token",
-                               target.token, "--api-key", target.api_key},
+        server = spawn_server({devserver, "--port", "0", "--storage", dir + "/storage",
+                               "--discard-data", "--token", target.token, "--api-key",
+                               target.api_key},
                               &port);
     } else {
         char self[4096];
@@ -288,14 +292,11 @@ int main(int argc, char **argv)
         RunResult e, c;
         if (i % 2 == 0) {
             e = engine_upload(target, path, static_cast<int>(size), &rss_growth);
-            drop_stored(storage);
             c = curl_upload(target, path);
         } else {
             c = curl_upload(target, path);
-            drop_stored(storage);
             e = engine_upload(target, path, static_cast<int>(size), &rss_growth);
         }
-        drop_stored(storage);
         if (!e.ok || !c.ok) {
             fprintf(stderr, "round %d failed (engine %d, curl %d)\n", i, e.ok, c.ok);
             ++failures;
@@ -420,9 +421,8 @@ int main(int argc, char **argv)
     kill(server, SIGTERM);
     waitpid(server, nullptr, 0);
     unlink(path.c_str());
-    std::string rm = "rm -rf '" + dir + "'" + (storage.empty() ? "" : " '" + storage + "'");
+    std::string rm = "rm -rf '" + dir + "'";
     if (system(rm.c_str()) != 0)
         fprintf(stderr, "could not remove %s\n", dir.c_str());
-    printf("%s\n", all_pass ? "all figures met" : "some figures missed");
-    return 0;
+    return finish(all_pass);
 }
