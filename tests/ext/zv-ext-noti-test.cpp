@@ -5,7 +5,6 @@
 
 #include <glib.h>
 #include <gtest/gtest.h>
-#include <stdlib.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
@@ -22,8 +21,6 @@ zv_test::LogFile g_log;
 const char kOngoing[] = "zuvo_ongoing_noti";
 const char kComplete[] = "zuvo_complete_noti";
 
-using Keys = std::map<std::string, std::string>;
-
 class NotiTest : public ::testing::Test
 {
   protected:
@@ -36,22 +33,25 @@ class NotiTest : public ::testing::Test
     }
     bool posted(const std::string &tag) const { return access(tray_file(tag).c_str(), F_OK) == 0; }
     // The keys of a posted notification; empty when it is not posted.
-    Keys keys(const std::string &tag) const
+    std::map<std::string, std::string> keys(const std::string &tag) const
     {
-        Keys result;
+        std::map<std::string, std::string> result;
         GKeyFile *kf = g_key_file_new();
-        if (g_key_file_load_from_file(kf, tray_file(tag).c_str(), G_KEY_FILE_NONE, nullptr)) {
-            gsize n = 0;
-            gchar **names = g_key_file_get_keys(kf, "notification", &n, nullptr);
-            for (gsize i = 0; i < n; i++) {
-                gchar *value = g_key_file_get_value(kf, "notification", names[i], nullptr);
-                result[names[i]] = value ? value : "";
-                g_free(value);
-            }
-            g_strfreev(names);
+        gchar **names = nullptr;
+        if (g_key_file_load_from_file(kf, tray_file(tag).c_str(), G_KEY_FILE_NONE, nullptr))
+            names = g_key_file_get_keys(kf, "notification", nullptr, nullptr);
+        for (gchar **name = names; name && *name; name++) {
+            gchar *value = g_key_file_get_value(kf, "notification", *name, nullptr);
+            result[*name] = value ? value : "";
+            g_free(value);
         }
+        g_strfreev(names);
         g_key_file_free(kf);
         return result;
+    }
+    double progress(const std::string &tag) const
+    {
+        return g_ascii_strtod(keys(tag)["progress"].c_str(), nullptr);
     }
 
     zv_test::TempDir dir_;
@@ -63,27 +63,26 @@ TEST_F(NotiTest, OngoingCreateWritesCountProgressAndLaunchTarget)
         int current, total;
         double progress;
         const char *count;
-        const char *progress_key; // nullptr: never set
+        bool has_progress;
     };
     const Case cases[] = {
-        {1, 3, 0.0, "[1/3]", "0"},
-        {1, 1, 0.5, "", "0.5"},
-        {0, 0, -1.0, "", nullptr},
+        {1, 3, 0.0, "[1/3]", true},
+        {1, 1, 0.5, "", true},
+        {0, 0, -1.0, "", false},
     };
     for (const Case &c : cases) {
         SCOPED_TRACE(c.count);
         ASSERT_EQ(zuvo_ext_noti_ongoing_noti_create("Uploading", "clip.mp4", c.current, c.total,
                                                     c.progress),
                   1);
-        Keys k = keys(kOngoing);
+        auto k = keys(kOngoing);
         EXPECT_EQ(k["type"], "ongoing");
         EXPECT_EQ(k["title"], "Uploading");
         EXPECT_EQ(k["content"], "clip.mp4");
         EXPECT_EQ(k["event_count"], c.count);
-        EXPECT_EQ(k.count("progress"), c.progress_key ? 1u : 0u);
-        if (c.progress_key) {
-            EXPECT_DOUBLE_EQ(g_ascii_strtod(k["progress"].c_str(), nullptr),
-                             g_ascii_strtod(c.progress_key, nullptr));
+        EXPECT_EQ(k.count("progress"), c.has_progress ? 1u : 0u);
+        if (c.has_progress) {
+            EXPECT_DOUBLE_EQ(progress(kOngoing), c.progress);
         }
         EXPECT_EQ(k["display_applist"], "11");
         EXPECT_EQ(k["tag"], kOngoing);
@@ -96,23 +95,21 @@ TEST_F(NotiTest, OngoingCreateWritesCountProgressAndLaunchTarget)
     EXPECT_TRUE(g_log.logged("sub_txt is NULL"));
 }
 
-TEST_F(NotiTest, UpdateRewritesOrCreatesWhenAbsent)
+// Posted by another process, the ongoing notification is updated, listed by zv-noti and
+// removed here; an update while none is posted creates it, and a negative progress keeps
+// the bar where it was.
+TEST_F(NotiTest, OngoingOfAnotherProcessIsUpdatedListedAndRemoved)
 {
-    zuvo_ext_noti_ongoing_noti_update("Uploading", "a.mp4", 0, 2, 0.25);
-    EXPECT_TRUE(g_log.logged("ongoing_noti_h is NULL. So, create it."));
-    EXPECT_EQ(keys(kOngoing)["display_applist"], "11");
+    const std::string noti = zv_test::bin_path("zv-noti");
+    std::string out;
+    EXPECT_EQ(zv_test::run_program({noti, "list"}, "", &out), 0);
+    EXPECT_EQ(out, "");
+    EXPECT_EQ(zv_test::run_program({noti}), 2);
+    EXPECT_EQ(zv_test::run_program({noti, "show"}), 2);
+    EXPECT_EQ(zv_test::run_program({noti, "list", "extra"}), 2);
+    EXPECT_EQ(zv_test::run_program({noti, "--help"}, "", &out), 0);
+    EXPECT_NE(out.find("zv-noti list"), std::string::npos);
 
-    // A negative progress keeps what the notification had.
-    zuvo_ext_noti_ongoing_noti_update("Uploading", "b.mp4", 1, 2, -1.0);
-    Keys k = keys(kOngoing);
-    EXPECT_EQ(k["content"], "b.mp4");
-    EXPECT_EQ(k["event_count"], "[1/2]");
-    EXPECT_EQ(k["display_applist"], "1");
-    EXPECT_DOUBLE_EQ(g_ascii_strtod(k["progress"].c_str(), nullptr), 0.25);
-}
-
-TEST_F(NotiTest, OngoingPostedByOneProcessIsUpdatedAndRemovedByAnother)
-{
     pid_t pid = fork();
     ASSERT_GE(pid, 0);
     if (pid == 0)
@@ -120,16 +117,11 @@ TEST_F(NotiTest, OngoingPostedByOneProcessIsUpdatedAndRemovedByAnother)
     int status = 0;
     ASSERT_EQ(waitpid(pid, &status, 0), pid);
     ASSERT_TRUE(WIFEXITED(status) && WEXITSTATUS(status) == 0);
-    ASSERT_TRUE(posted(kOngoing));
-
     zuvo_ext_noti_ongoing_noti_update("Uploading", "second.mp4", 0, 1, 0.6);
     EXPECT_FALSE(g_log.logged("So, create it."));
-    EXPECT_EQ(keys(kOngoing)["content"], "second.mp4");
-
-    std::string listing;
-    ASSERT_EQ(zv_test::run_program({zv_test::bin_path("zv-noti"), "list"}, "", &listing), 0);
-    EXPECT_NE(listing.find(std::string("[") + kOngoing + "]"), std::string::npos) << listing;
-    EXPECT_NE(listing.find("content=second.mp4"), std::string::npos) << listing;
+    ASSERT_EQ(zv_test::run_program({noti, "list"}, "", &out), 0);
+    EXPECT_NE(out.find(std::string("[") + kOngoing + "]"), std::string::npos) << out;
+    EXPECT_NE(out.find("content=second.mp4"), std::string::npos) << out;
 
     zuvo_ext_noti_ongoing_noti_destroy();
     EXPECT_FALSE(posted(kOngoing));
@@ -137,6 +129,16 @@ TEST_F(NotiTest, OngoingPostedByOneProcessIsUpdatedAndRemovedByAnother)
     zuvo_ext_noti_ongoing_noti_destroy();
     EXPECT_TRUE(g_log.logged("\033[32m[TID:"));
     EXPECT_TRUE(g_log.logged("Zuvo Noti Ongoing Tag is not existed. ==="));
+
+    zuvo_ext_noti_ongoing_noti_update("Uploading", "a.mp4", 0, 2, 0.25);
+    EXPECT_TRUE(g_log.logged("ongoing_noti_h is NULL. So, create it."));
+    EXPECT_EQ(keys(kOngoing)["display_applist"], "11");
+    zuvo_ext_noti_ongoing_noti_update("Uploading", "b.mp4", 1, 2, -1.0);
+    auto k = keys(kOngoing);
+    EXPECT_EQ(k["content"], "b.mp4");
+    EXPECT_EQ(k["event_count"], "[1/2]");
+    EXPECT_EQ(k["display_applist"], "1");
+    EXPECT_DOUBLE_EQ(progress(kOngoing), 0.25);
 }
 
 TEST_F(NotiTest, UnreadableTrayFileIsTakenAsAbsentAndLogged)
@@ -158,12 +160,12 @@ TEST_F(NotiTest, UnreadableTrayFileIsTakenAsAbsentAndLogged)
     }
 }
 
-TEST_F(NotiTest, CompletionReplacesOngoingAndOpensNothing)
+TEST_F(NotiTest, CompletionReplacesOngoingOpensNothingAndStays)
 {
     ASSERT_TRUE(zuvo_ext_noti_ongoing_noti_create("Uploading", "a.mp4", 1, 2, 0.5));
     ASSERT_EQ(zuvo_ext_noti_complete_noti_create("Uploaded", "2 files"), 1);
     EXPECT_FALSE(posted(kOngoing));
-    Keys k = keys(kComplete);
+    auto k = keys(kComplete);
     EXPECT_EQ(k["type"], "noti");
     EXPECT_EQ(k["title"], "Uploaded");
     EXPECT_EQ(k["content"], "2 files");
@@ -176,31 +178,13 @@ TEST_F(NotiTest, CompletionReplacesOngoingAndOpensNothing)
     // Destroy releases the handle only: the notification stays in the tray.
     zuvo_ext_noti_complete_noti_destroy();
     EXPECT_TRUE(posted(kComplete));
-    g_log.mark();
     zuvo_ext_noti_complete_noti_destroy();
     EXPECT_TRUE(g_log.logged("noti handle is NULL"));
-}
 
-TEST_F(NotiTest, StatusMessagesAreAppendedOneALine)
-{
     zuvo_ext_noti_message_post("first");
     zuvo_ext_noti_message_post("second\nline");
     EXPECT_EQ(zv_test::read_file(dir_.file("run/notifications/status-messages.log")),
               "first\nsecond line\n");
-}
-
-TEST_F(NotiTest, ZvNotiRejectsWrongCalls)
-{
-    const std::string noti = zv_test::bin_path("zv-noti");
-    EXPECT_EQ(zv_test::run_program({noti}), 2);
-    EXPECT_EQ(zv_test::run_program({noti, "show"}), 2);
-    EXPECT_EQ(zv_test::run_program({noti, "list", "extra"}), 2);
-    std::string help;
-    EXPECT_EQ(zv_test::run_program({noti, "--help"}, "", &help), 0);
-    EXPECT_NE(help.find("zv-noti list"), std::string::npos);
-    std::string empty;
-    EXPECT_EQ(zv_test::run_program({noti, "list"}, "", &empty), 0);
-    EXPECT_EQ(empty, "");
 }
 
 } // namespace
