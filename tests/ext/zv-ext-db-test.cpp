@@ -49,26 +49,28 @@ class LockHolder
     std::thread thread_;
 };
 
-// The rows of one load, released with it.
-class Loaded
+// The rows of a load, one a line: historyid title filename filesize url percent status
+// userid date, "-" for NULL.
+std::string load(bool ready_only = false)
 {
-  public:
-    explicit Loaded(bool ready_only = false)
-    {
-        EXPECT_EQ(ready_only ? zv_ext_db_load_ready_item_list(&list_)
-                             : zv_ext_db_load_full_item_list(&list_),
-                  1);
+    GList *list = nullptr;
+    EXPECT_EQ(ready_only ? zv_ext_db_load_ready_item_list(&list)
+                         : zv_ext_db_load_full_item_list(&list),
+              1);
+    auto text = [](const char *s) { return s ? s : "-"; };
+    std::string out;
+    for (GList *l = list; l; l = l->next) {
+        auto *r = static_cast<DbItem *>(l->data);
+        gchar *line = g_strdup_printf(
+            "%d %s %s %lld %s %d %d %s %g\n", r->historyid, text(r->title), text(r->filename),
+            (long long)r->filesize, text(r->url), r->percent, r->status, text(r->userid), r->date);
+        out += line;
+        g_free(line);
     }
-    ~Loaded() { zv_ext_db_free_item_list(list_); }
-    size_t size() const { return g_list_length(list_); }
-    const DbItem &operator[](unsigned i) const
-    {
-        return *static_cast<DbItem *>(g_list_nth_data(list_, i));
-    }
-
-  private:
-    GList *list_ = nullptr;
-};
+    if (list)
+        zv_ext_db_free_item_list(list);
+    return out;
+}
 
 class HistoryStoreTest : public ::testing::Test
 {
@@ -79,52 +81,24 @@ class HistoryStoreTest : public ::testing::Test
     std::string db_path() const { return tmp_.file("db/.zuvo-history.db"); }
 
     // A row of a file past 4 GiB (a 64-bit column) at 7 percent.
-    static void insert(int historyid, int status, double date, const char *title = "t",
+    static void insert(int id, int status, double date, const char *title = "t",
                        const char *url = nullptr, const char *userid = nullptr)
     {
-        DbItem item{};
-        item.historyid = historyid;
-        item.status = status;
-        item.date = date;
-        item.title = const_cast<char *>(title);
-        item.url = const_cast<char *>(url);
-        item.userid = const_cast<char *>(userid);
-        item.filename = const_cast<char *>("/videos/a.mp4");
-        item.filesize = 5000000000LL;
-        item.percent = 7;
+        DbItem item{id,       str(userid), str(title), str("/videos/a.mp4"), 5000000000LL, 7,
+                    str(url), status,      date};
         ASSERT_EQ(zv_ext_db_insert_item(&item), 1);
     }
-    static int update(int historyid, int percent, int status, const char *url = nullptr)
+    // Only percent, status and url are to be written.
+    static int update(int id, int percent, int status, const char *url = nullptr)
     {
-        DbItem item{};
-        item.historyid = historyid;
-        item.percent = percent;
-        item.status = status;
-        item.url = const_cast<char *>(url);
-        item.title = const_cast<char *>("changed");
-        item.filename = const_cast<char *>("/changed");
-        item.filesize = 1;
-        item.date = 99;
+        DbItem item{id,     str("u"), str("changed"), str("/changed"), 1, percent, str(url),
+                    status, 99};
         return zv_ext_db_update_item(&item);
     }
+    static char *str(const char *s) { return const_cast<char *>(s); }
 
     zv_test::TempDir tmp_;
 };
-
-TEST_F(HistoryStoreTest, OpenMakesTheFolderAndRowsOutliveTheConnection)
-{
-    struct stat st;
-    ASSERT_NE(stat(tmp_.file("db").c_str(), &st), 0);
-    ASSERT_EQ(zv_ext_db_open(), 1);
-    EXPECT_TRUE(g_log.logged("make default dbdir"));
-    EXPECT_TRUE(g_log.logged("success make dbdir"));
-    EXPECT_EQ(zv_ext_db_open(), 1);
-    insert(1, ZV_UPLOAD_STATUS_READY, 1);
-    zv_ext_db_close();
-    EXPECT_EQ(zv_ext_db_get_full_count(), -1);
-    ASSERT_EQ(zv_ext_db_open(), 1);
-    EXPECT_EQ(zv_ext_db_get_full_count(), 1);
-}
 
 // A lock of the other process past the busy handler's five waits makes statements fail (an
 // update says so, to be stored again); a shorter one is waited for.
@@ -147,7 +121,7 @@ TEST_F(HistoryStoreTest, LockOfTheOtherProcess)
     // The store's lines stay whole; the library's message follows on a line of its own.
     for (const char *line : {"SQL error: 5", "SQL return: 5", "sqlite: database is locked"})
         EXPECT_TRUE(g_log.logged(std::string(line) + ZV_LOG_RESET "\n")) << line;
-    EXPECT_EQ(Loaded()[0].percent, 7);
+    EXPECT_EQ(load(), "5 t /videos/a.mp4 5000000000 - 7 1 - 1\n");
 
     g_log.mark();
     {
@@ -155,10 +129,7 @@ TEST_F(HistoryStoreTest, LockOfTheOtherProcess)
         EXPECT_EQ(update(5, 40, ZV_UPLOAD_STATUS_UPLOADING), 1);
     }
     EXPECT_FALSE(g_log.logged("SQLITE_BUSY"));
-    Loaded rows;
-    ASSERT_EQ(rows.size(), 1u);
-    EXPECT_EQ(rows[0].percent, 40);
-    EXPECT_EQ(rows[0].status, ZV_UPLOAD_STATUS_UPLOADING);
+    EXPECT_EQ(load(), "5 t /videos/a.mp4 5000000000 - 40 3 - 1\n");
 }
 
 TEST_F(HistoryStoreTest, InsertTrimsCompletedRowsPast5000)
@@ -193,50 +164,29 @@ TEST_F(HistoryStoreTest, InsertTrimsCompletedRowsPast5000)
     }
 }
 
-TEST_F(HistoryStoreTest, RowsLoadInDateOrderWithTheirNulls)
+TEST_F(HistoryStoreTest, RowsLoadInDateOrderWithTheirNullsAndCountsByStatus)
 {
     ASSERT_EQ(zv_ext_db_open(), 1);
-    GList *list = nullptr;
-    EXPECT_EQ(zv_ext_db_load_full_item_list(&list), 1);
-    EXPECT_EQ(list, nullptr);
-    EXPECT_EQ(zv_ext_db_free_item_list(list), 0);
+    EXPECT_EQ(load(), "");
+    EXPECT_EQ(zv_ext_db_free_item_list(nullptr), 0);
     EXPECT_EQ(zv_ext_db_insert_item(nullptr), 0);
-
     insert(3, ZV_UPLOAD_STATUS_READY, 30.5, "third", "http://u/3", "me");
     insert(1, ZV_UPLOAD_STATUS_COMPLETED, 10.25, nullptr);
     insert(2, ZV_UPLOAD_STATUS_READY, 20, "second", nullptr, "me");
-    Loaded rows;
-    ASSERT_EQ(rows.size(), 3u);
-    EXPECT_EQ(rows[0].historyid, 1);
-    EXPECT_EQ(rows[1].historyid, 2);
-    EXPECT_EQ(rows[2].historyid, 3);
-    EXPECT_DOUBLE_EQ(rows[0].date, 10.25);
-    EXPECT_EQ(rows[0].title, nullptr);
-    EXPECT_EQ(rows[0].url, nullptr);
-    EXPECT_EQ(rows[0].userid, nullptr);
-    EXPECT_STREQ(rows[2].title, "third");
-    EXPECT_STREQ(rows[2].url, "http://u/3");
-    EXPECT_STREQ(rows[2].userid, "me");
-    EXPECT_STREQ(rows[2].filename, "/videos/a.mp4");
-    EXPECT_EQ(rows[2].filesize, 5000000000LL);
-    EXPECT_EQ(rows[2].percent, 7);
-    Loaded ready(true);
-    ASSERT_EQ(ready.size(), 2u);
-    EXPECT_EQ(ready[0].historyid, 2);
-    EXPECT_EQ(ready[1].historyid, 3);
-}
+    EXPECT_EQ(load(), "1 - /videos/a.mp4 5000000000 - 7 4 - 10.25\n"
+                      "2 second /videos/a.mp4 5000000000 - 7 0 me 20\n"
+                      "3 third /videos/a.mp4 5000000000 http://u/3 7 0 me 30.5\n");
+    EXPECT_EQ(load(true), "2 second /videos/a.mp4 5000000000 - 7 0 me 20\n"
+                          "3 third /videos/a.mp4 5000000000 http://u/3 7 0 me 30.5\n");
 
-TEST_F(HistoryStoreTest, CountsByStatusGroup)
-{
-    ASSERT_EQ(zv_ext_db_open(), 1);
-    // 1 READY, 2 WAITING, 3 PAUSED, 4 UPLOADING and 5 COMPLETED rows.
-    for (int status = 0, id = 0; status < 5; ++status)
-        for (int i = 0; i <= status; ++i, ++id)
+    // Now 2 READY, 3 WAITING, 4 PAUSED, 5 UPLOADING and 7 COMPLETED rows.
+    for (int status = 1, id = 10; status < 5; ++status)
+        for (int i = 0; i <= status + 1; ++i, ++id)
             insert(id, status, id);
-    EXPECT_EQ(zv_ext_db_get_active_count(), 1 + 2 + 3 + 4);
-    EXPECT_EQ(zv_ext_db_get_uploading_count(), 2 + 4);
-    EXPECT_EQ(zv_ext_db_get_completed_count(), 5);
-    EXPECT_EQ(zv_ext_db_get_full_count(), 15);
+    EXPECT_EQ(zv_ext_db_get_active_count(), 2 + 3 + 4 + 5);
+    EXPECT_EQ(zv_ext_db_get_uploading_count(), 3 + 5);
+    EXPECT_EQ(zv_ext_db_get_completed_count(), 7);
+    EXPECT_EQ(zv_ext_db_get_full_count(), 21);
 }
 
 TEST_F(HistoryStoreTest, UpdateWritesPercentStatusAndUrlDeleteTakesEveryRowOfTheId)
@@ -245,32 +195,20 @@ TEST_F(HistoryStoreTest, UpdateWritesPercentStatusAndUrlDeleteTakesEveryRowOfThe
     insert(8, ZV_UPLOAD_STATUS_WAITING, 2.5, "title", nullptr, "user");
     insert(9, ZV_UPLOAD_STATUS_WAITING, 3.5, "other", "http://keep", "user");
     ASSERT_EQ(update(8, 55, ZV_UPLOAD_STATUS_UPLOADING, "http://upload/8"), 1);
-    {
-        Loaded rows;
-        ASSERT_EQ(rows.size(), 2u);
-        EXPECT_EQ(rows[0].percent, 55);
-        EXPECT_EQ(rows[0].status, ZV_UPLOAD_STATUS_UPLOADING);
-        EXPECT_STREQ(rows[0].url, "http://upload/8");
-        EXPECT_STREQ(rows[0].title, "title");
-        EXPECT_STREQ(rows[0].filename, "/videos/a.mp4");
-        EXPECT_STREQ(rows[0].userid, "user");
-        EXPECT_EQ(rows[0].filesize, 5000000000LL);
-        EXPECT_DOUBLE_EQ(rows[0].date, 2.5);
-        EXPECT_STREQ(rows[1].url, "http://keep");
-        EXPECT_EQ(rows[1].percent, 7);
-    }
-    ASSERT_EQ(update(8, 55, ZV_UPLOAD_STATUS_UPLOADING), 1);
-    EXPECT_EQ(Loaded()[0].url, nullptr);
+    const std::string nine = "9 other /videos/a.mp4 5000000000 http://keep 7 1 user 3.5\n";
+    EXPECT_EQ(load(), "8 title /videos/a.mp4 5000000000 http://upload/8 55 3 user 2.5\n" + nine);
+    ASSERT_EQ(update(8, 60, ZV_UPLOAD_STATUS_PAUSED), 1);
+    EXPECT_EQ(load(), "8 title /videos/a.mp4 5000000000 - 60 2 user 2.5\n" + nine);
 
     insert(8, ZV_UPLOAD_STATUS_READY, 4);
     EXPECT_EQ(zv_ext_db_delete_item(99), 1);
     EXPECT_EQ(zv_ext_db_delete_item(8), 1);
-    Loaded rows;
-    ASSERT_EQ(rows.size(), 1u);
-    EXPECT_EQ(rows[0].historyid, 9);
+    EXPECT_EQ(load(), nine);
 }
 
-TEST_F(HistoryStoreTest, FileThatIsNotADatabaseIsLeftAloneUntilItIsGone)
+// A file that is not a database is left as it is and every operation fails; once it is
+// gone, open makes the folder and the file, whose rows outlive the connection.
+TEST_F(HistoryStoreTest, OpenLeavesAForeignFileAloneAndMakesFolderAndFile)
 {
     ASSERT_EQ(mkdir(tmp_.file("db").c_str(), 0700), 0);
     ASSERT_TRUE(zv_test::write_file(db_path(), std::string(4096, 'x')));
@@ -285,8 +223,15 @@ TEST_F(HistoryStoreTest, FileThatIsNotADatabaseIsLeftAloneUntilItIsGone)
     EXPECT_EQ(zv_test::read_file(db_path()), std::string(4096, 'x'));
 
     ASSERT_EQ(unlink(db_path().c_str()), 0);
+    ASSERT_EQ(rmdir(tmp_.file("db").c_str()), 0);
     ASSERT_EQ(zv_ext_db_open(), 1);
+    EXPECT_TRUE(g_log.logged("make default dbdir"));
+    EXPECT_TRUE(g_log.logged("success make dbdir"));
+    EXPECT_EQ(zv_ext_db_open(), 1);
     EXPECT_EQ(zv_ext_db_insert_item(&item), 1);
+    zv_ext_db_close();
+    EXPECT_EQ(zv_ext_db_get_full_count(), -1);
+    ASSERT_EQ(zv_ext_db_open(), 1);
     EXPECT_EQ(zv_ext_db_get_full_count(), 1);
 }
 
