@@ -18,7 +18,6 @@ namespace
 using zv_test::wait_for;
 
 zv_test::LogFile g_log;
-zv_test::TempDir g_dir;
 int g_context;       // the user data handed to the watchers
 std::string g_calls; // the callbacks' calls in order, one a line
 
@@ -56,9 +55,10 @@ std::string set_key(const char *key, int value, const char *line, const std::str
     return g_calls;
 }
 
-// One registration for the whole program: watches last for the process.
+// Watches last for the process: one registration, deregistered and made again.
 TEST(NetworkTest, KeyChangesReachTheCallbacksUntilDeregistration)
 {
+    zv_test::TempDir dir;
     ASSERT_EQ(vconf_set_int(VCONFKEY_NETWORK_STATUS, 0), VCONF_OK);
     ASSERT_EQ(vconf_set_int(VCONFKEY_NETWORK_CONFIGURATION_CHANGE_IND, 0), VCONF_OK);
     ASSERT_EQ(vconf_set_str(VCONFKEY_NETWORK_IP, "10.1.2.3"), VCONF_OK);
@@ -99,7 +99,9 @@ TEST(NetworkTest, KeyChangesReachTheCallbacksUntilDeregistration)
 
 TEST(NetworkTest, CheckAndGettersReadTheKeys)
 {
-    const std::string status_file = g_dir.file("run/vconf/" VCONFKEY_NETWORK_STATUS);
+    zv_test::TempDir dir;
+    ASSERT_EQ(vconf_set_str(VCONFKEY_NETWORK_IP, "192.168.7.9"), VCONF_OK);
+    const std::string status_file = dir.file("run/vconf/" VCONFKEY_NETWORK_STATUS);
     struct Case {
         const char *text; // nullptr: no key file
         int usable;
@@ -114,10 +116,9 @@ TEST(NetworkTest, CheckAndGettersReadTheKeys)
             unlink(status_file.c_str());
         EXPECT_EQ(zv_ext_network_check(), c.usable);
     }
-    ASSERT_EQ(vconf_set_str(VCONFKEY_NETWORK_IP, "192.168.7.9"), VCONF_OK);
     std::unique_ptr<char, decltype(&free)> ip(zv_ext_network_get_ip(), free);
     EXPECT_STREQ(ip.get(), "192.168.7.9");
-    unlink(g_dir.file("run/vconf/" VCONFKEY_NETWORK_PROXY).c_str());
+    unlink(dir.file("run/vconf/" VCONFKEY_NETWORK_PROXY).c_str());
     EXPECT_EQ(zv_ext_network_get_proxy(), nullptr);
 }
 
