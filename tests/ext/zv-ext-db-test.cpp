@@ -114,9 +114,6 @@ TEST_F(HistoryStoreTest, LockOfTheOtherProcess)
         EXPECT_EQ(update(5, 40, ZV_UPLOAD_STATUS_UPLOADING), 0);
         done = true;
     }
-    for (int count = 0; count < 5; ++count)
-        EXPECT_TRUE(g_log.logged("busy handler called (count : " + std::to_string(count) + ")"));
-    EXPECT_FALSE(g_log.logged("busy handler called (count : 5)"));
     EXPECT_TRUE(g_log.logged("busy handler will be returned SQLITE_BUSY error"));
     // The store's lines stay whole; the library's message follows on a line of its own.
     for (const char *line : {"SQL error: 5", "SQL return: 5", "sqlite: database is locked"})
