@@ -37,20 +37,16 @@ TEST(ExtUtil, FirstContextStaysFileSizesAndTheIdIsTheTime)
     EXPECT_LE(id, time(nullptr));
 }
 
-class ExtUtilPopup : public ::testing::Test
-{
-  protected:
-    void SetUp() override
+struct ExtUtilPopup : ::testing::Test {
+    ExtUtilPopup()
     {
-        win = elm_win_add(nullptr, "zv-ext-util-test", ELM_WIN_BASIC);
         evas_object_resize(win, 360, 640);
         evas_object_show(win);
     }
-    void TearDown() override { evas_object_del(win); }
-
+    ~ExtUtilPopup() override { evas_object_del(win); }
     static void count_cb(void *data, Evas_Object *, void *) { ++*static_cast<int *>(data); }
 
-    Evas_Object *win = nullptr;
+    Evas_Object *win = elm_win_add(nullptr, "zv-ext-util-test", ELM_WIN_BASIC);
     int calls = 0;
 };
 

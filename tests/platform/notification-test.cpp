@@ -123,20 +123,15 @@ class DesktopNotificationTest : public ::testing::Test
             GTEST_SKIP() << "runs on a private session bus (dbus-run-session)";
         g_calls.clear();
     }
-
     // The id the service gave to the notification of tag, as the notifier keeps it.
     static std::string id_file(const char *tag)
     {
         return dir_->file(std::string("run/notifications/desktop/") + tag);
     }
-    static zv_test::TempDir *dir_;
-    static Eldbus_Connection *conn_;
-    static Eldbus_Service_Interface *iface_;
+    static inline zv_test::TempDir *dir_ = nullptr;
+    static inline Eldbus_Connection *conn_ = nullptr;
+    static inline Eldbus_Service_Interface *iface_ = nullptr;
 };
-
-zv_test::TempDir *DesktopNotificationTest::dir_ = nullptr;
-Eldbus_Connection *DesktopNotificationTest::conn_ = nullptr;
-Eldbus_Service_Interface *DesktopNotificationTest::iface_ = nullptr;
 
 // Updates made before the service has answered are sent once it has, as replacements of the
 // id it gave; a delete closes that id.
