@@ -41,8 +41,8 @@ void config_cb(char *ip, char *proxy, void *userp)
     free(proxy);
 }
 
-// Sets an int key from another process, then waits until the watcher has logged line
-// (it does before any callback) and at least calls have been made: the calls made.
+// Sets an int key from another process and waits until a watcher has logged line (it logs
+// before it calls back) and the calls are as long as the expected ones: the calls made.
 std::string set_key(const char *key, int value, const char *line, const std::string &calls = "")
 {
     g_calls.clear();
@@ -68,9 +68,7 @@ TEST(NetworkTest, KeyChangesReachTheCallbacksUntilDeregistration)
     ASSERT_EQ(zv_ext_network_register(&g_context, onoff_cb, status_cb, config_cb), 1);
 
     const std::string config = "config 10.1.2.3 http://proxy.test:3128\n";
-    const std::string wifi = std::to_string(ZV_NETWORK_TYPE_WIFI);
-    const std::string none = std::to_string(ZV_NETWORK_TYPE_NONE);
-    const std::string cellular = "status " + std::to_string(ZV_NETWORK_TYPE_CELLULAR) + "\n";
+    auto status = [](int type) { return "status " + std::to_string(type) + "\n"; };
     struct Case {
         const char *key;
         int value;
@@ -78,10 +76,11 @@ TEST(NetworkTest, KeyChangesReachTheCallbacksUntilDeregistration)
         std::string calls;
     };
     const Case cases[] = {
-        {VCONFKEY_NETWORK_STATUS, 2, "NETWORK_WIFI", "status " + wifi + "\n"},
-        {VCONFKEY_NETWORK_STATUS, 1, "NETWORK_CELLULAR", cellular},
-        {VCONFKEY_NETWORK_STATUS, 0, "_zv_ext_network_network_status_cb", "status " + none + "\n"},
-        {VCONFKEY_NETWORK_STATUS, 3, "NETWORK_UNKNOWN", "status " + none + "\n"},
+        {VCONFKEY_NETWORK_STATUS, 2, "NETWORK_WIFI", status(ZV_NETWORK_TYPE_WIFI)},
+        {VCONFKEY_NETWORK_STATUS, 1, "NETWORK_CELLULAR", status(ZV_NETWORK_TYPE_CELLULAR)},
+        {VCONFKEY_NETWORK_STATUS, 0, "_zv_ext_network_network_status_cb",
+         status(ZV_NETWORK_TYPE_NONE)},
+        {VCONFKEY_NETWORK_STATUS, 3, "NETWORK_UNKNOWN", status(ZV_NETWORK_TYPE_NONE)},
         {VCONFKEY_NETWORK_CONFIGURATION_CHANGE_IND, 1, "VCONFKEY_NETWORK_ON", "onoff 1\n" + config},
         {VCONFKEY_NETWORK_CONFIGURATION_CHANGE_IND, 0, "VCONFKEY_NETWORK_CLOSE",
          "onoff 0\n" + config},
@@ -93,7 +92,8 @@ TEST(NetworkTest, KeyChangesReachTheCallbacksUntilDeregistration)
     EXPECT_EQ(zv_ext_network_deregister(), 1);
     EXPECT_EQ(set_key(VCONFKEY_NETWORK_STATUS, 2, "NETWORK_WIFI"), "");
     ASSERT_EQ(zv_ext_network_register(&g_context, onoff_cb, status_cb, config_cb), 1);
-    EXPECT_EQ(set_key(VCONFKEY_NETWORK_STATUS, 1, "NETWORK_CELLULAR", cellular), cellular);
+    EXPECT_EQ(set_key(VCONFKEY_NETWORK_STATUS, 1, "NETWORK_CELLULAR", status(1)),
+              status(ZV_NETWORK_TYPE_CELLULAR));
     zv_ext_network_deregister();
 }
 
