@@ -22,8 +22,7 @@
 
 using namespace zv_test;
 
-namespace
-{
+namespace {
 
 using Extras = std::vector<std::pair<std::string, std::string>>;
 
@@ -222,9 +221,8 @@ TEST(AppCommandLine, WrongCallsAnswerOneLineAndStatus2)
     EXPECT_NE(out.find("--extra KEY=VALUE"), std::string::npos);
 }
 
-class AppInstanceTest : public ::testing::Test
-{
-  protected:
+class AppInstanceTest : public ::testing::Test {
+protected:
     void SetUp() override { setenv("ZV_PROBE_LOG", log_.c_str(), 1); }
     void TearDown() override
     {
@@ -381,18 +379,16 @@ TEST_F(AppInstanceTest, LaunchRequestStartsTheServiceWhenNoneRuns)
 
     // The service started beside this program now owns the socket; end it through its pid.
     int fd = -1;
-    ASSERT_TRUE(wait_for(
-        [&] {
-            fd = socket(AF_UNIX, SOCK_STREAM, 0);
-            struct sockaddr_un addr = {};
-            addr.sun_family = AF_UNIX;
-            strncpy(addr.sun_path, socket_.c_str(), sizeof addr.sun_path - 1);
-            if (connect(fd, (struct sockaddr *)&addr, sizeof addr) == 0)
-                return true;
-            close(fd);
-            return false;
-        },
-        20000));
+    ASSERT_TRUE(wait_for([&] {
+        fd = socket(AF_UNIX, SOCK_STREAM, 0);
+        struct sockaddr_un addr = {};
+        addr.sun_family = AF_UNIX;
+        strncpy(addr.sun_path, socket_.c_str(), sizeof addr.sun_path - 1);
+        if (connect(fd, (struct sockaddr *)&addr, sizeof addr) == 0)
+            return true;
+        close(fd);
+        return false;
+    }, 20000));
     struct ucred cred;
     socklen_t len = sizeof cred;
     ASSERT_EQ(getsockopt(fd, SOL_SOCKET, SO_PEERCRED, &cred, &len), 0);

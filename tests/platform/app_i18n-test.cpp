@@ -16,8 +16,7 @@
 
 using namespace zv_test;
 
-namespace
-{
+namespace {
 
 // The msgid/msgstr pairs of a catalogue (single-line entries, as ours are).
 std::vector<std::pair<std::string, std::string>> catalogue(const std::string &path)

@@ -15,8 +15,7 @@
 
 using namespace zv_test;
 
-namespace
-{
+namespace {
 
 std::vector<std::string> g_calls;
 
@@ -37,15 +36,13 @@ void press(const char *keyname)
     ev->key = keyname;
     ev->string = "";
     ev->timestamp = (unsigned int)(ecore_time_get() * 1000);
-    ecore_event_add(
-        ECORE_EVENT_KEY_DOWN, ev, [](void *, void *e) { free(e); }, nullptr);
+    ecore_event_add(ECORE_EVENT_KEY_DOWN, ev, [](void *, void *e) { free(e); }, nullptr);
     size_t before = g_calls.size();
     wait_for([&] { return g_calls.size() > before; }, 500);
 }
 
-class EextTest : public ::testing::Test
-{
-  protected:
+class EextTest : public ::testing::Test {
+protected:
     void SetUp() override
     {
         g_calls.clear();

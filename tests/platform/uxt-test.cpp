@@ -17,8 +17,7 @@
 
 using namespace zv_test;
 
-namespace
-{
+namespace {
 
 // The tables as the build lays them out under its resource folder.
 std::string table_path(const char *name)
