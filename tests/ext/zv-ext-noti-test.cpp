@@ -5,11 +5,11 @@
 
 #include <glib.h>
 #include <gtest/gtest.h>
-#include <stdlib.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
 #include <map>
+#include <string.h>
 #include <string>
 
 #include "zv-test-util.h"
@@ -22,8 +22,6 @@ zv_test::LogFile g_log;
 const char kOngoing[] = "zuvo_ongoing_noti";
 const char kComplete[] = "zuvo_complete_noti";
 
-using Keys = std::map<std::string, std::string>;
-
 class NotiTest : public ::testing::Test
 {
   protected:
@@ -34,24 +32,27 @@ class NotiTest : public ::testing::Test
     {
         return dir_.file("run/notifications/" + tag + ".ini");
     }
-    bool posted(const std::string &tag) const { return access(tray_file(tag).c_str(), F_OK) == 0; }
-    // The keys of a posted notification; empty when it is not posted.
-    Keys keys(const std::string &tag) const
+    // The keys of a posted notification in name order, "name=value;" each (time only said
+    // to be set); empty when it is not posted.
+    std::string tray(const std::string &tag) const
     {
-        Keys result;
+        std::map<std::string, std::string> keys;
         GKeyFile *kf = g_key_file_new();
-        if (g_key_file_load_from_file(kf, tray_file(tag).c_str(), G_KEY_FILE_NONE, nullptr)) {
-            gsize n = 0;
-            gchar **names = g_key_file_get_keys(kf, "notification", &n, nullptr);
-            for (gsize i = 0; i < n; i++) {
-                gchar *value = g_key_file_get_value(kf, "notification", names[i], nullptr);
-                result[names[i]] = value ? value : "";
-                g_free(value);
-            }
-            g_strfreev(names);
+        gchar **names = nullptr;
+        if (g_key_file_load_from_file(kf, tray_file(tag).c_str(), G_KEY_FILE_NONE, nullptr))
+            names = g_key_file_get_keys(kf, "notification", nullptr, nullptr);
+        for (gchar **name = names; name && *name; name++) {
+            gchar *value = g_key_file_get_value(kf, "notification", *name, nullptr);
+            keys[*name] =
+                !strcmp(*name, "time") && g_ascii_strtoll(value, nullptr, 10) > 0 ? "set" : value;
+            g_free(value);
         }
+        g_strfreev(names);
         g_key_file_free(kf);
-        return result;
+        std::string out;
+        for (const auto &kv : keys)
+            out += kv.first + "=" + kv.second + ";";
+        return out;
     }
 
     zv_test::TempDir dir_;
@@ -59,60 +60,40 @@ class NotiTest : public ::testing::Test
 
 TEST_F(NotiTest, OngoingCreateWritesCountProgressAndLaunchTarget)
 {
-    struct Case {
-        int current, total;
-        double progress;
-        const char *count;
-        const char *progress_key; // nullptr: never set
+    const char *cases[][5] = {
+        // current, total, progress, event count, progress key
+        {"1", "3", "0", "[1/3]", "progress=0;"},
+        {"1", "1", "0.5", "", "progress=0.5;"},
+        {"0", "0", "-1", "", ""},
     };
-    const Case cases[] = {
-        {1, 3, 0.0, "[1/3]", "0"},
-        {1, 1, 0.5, "", "0.5"},
-        {0, 0, -1.0, "", nullptr},
-    };
-    for (const Case &c : cases) {
-        SCOPED_TRACE(c.count);
-        ASSERT_EQ(zuvo_ext_noti_ongoing_noti_create("Uploading", "clip.mp4", c.current, c.total,
-                                                    c.progress),
+    for (const auto &c : cases) {
+        ASSERT_EQ(zuvo_ext_noti_ongoing_noti_create("Uploading", "clip.mp4", atoi(c[0]), atoi(c[1]),
+                                                    g_ascii_strtod(c[2], nullptr)),
                   1);
-        Keys k = keys(kOngoing);
-        EXPECT_EQ(k["type"], "ongoing");
-        EXPECT_EQ(k["title"], "Uploading");
-        EXPECT_EQ(k["content"], "clip.mp4");
-        EXPECT_EQ(k["event_count"], c.count);
-        EXPECT_EQ(k.count("progress"), c.progress_key ? 1u : 0u);
-        if (c.progress_key) {
-            EXPECT_DOUBLE_EQ(g_ascii_strtod(k["progress"].c_str(), nullptr),
-                             g_ascii_strtod(c.progress_key, nullptr));
-        }
-        EXPECT_EQ(k["display_applist"], "11");
-        EXPECT_EQ(k["tag"], kOngoing);
-        EXPECT_EQ(k["launch_app_id"], "zuvo-upload-svc");
-        EXPECT_EQ(k["disable_app_launch"], "false");
+        EXPECT_EQ(tray(kOngoing), std::string("content=clip.mp4;disable_app_launch=false;"
+                                              "display_applist=11;event_count=") +
+                                      c[3] + ";launch_app_id=zuvo-upload-svc;" + c[4] +
+                                      "tag=zuvo_ongoing_noti;title=Uploading;type=ongoing;");
     }
     EXPECT_FALSE(zuvo_ext_noti_ongoing_noti_create(nullptr, "x", 0, 0, 0.0));
-    EXPECT_TRUE(g_log.logged("title_text is NULL"));
     EXPECT_FALSE(zuvo_ext_noti_ongoing_noti_create("x", nullptr, 0, 0, 0.0));
-    EXPECT_TRUE(g_log.logged("sub_txt is NULL"));
 }
 
-TEST_F(NotiTest, UpdateRewritesOrCreatesWhenAbsent)
+// Posted by another process, the ongoing notification is updated, listed by zv-noti and
+// removed here; an update while none is posted creates it, and a negative progress keeps
+// the bar where it was.
+TEST_F(NotiTest, OngoingOfAnotherProcessIsUpdatedListedAndRemoved)
 {
-    zuvo_ext_noti_ongoing_noti_update("Uploading", "a.mp4", 0, 2, 0.25);
-    EXPECT_TRUE(g_log.logged("ongoing_noti_h is NULL. So, create it."));
-    EXPECT_EQ(keys(kOngoing)["display_applist"], "11");
+    const std::string noti = zv_test::bin_path("zv-noti");
+    std::string out;
+    EXPECT_EQ(zv_test::run_program({noti, "list"}, "", &out), 0);
+    EXPECT_EQ(out, "");
+    EXPECT_EQ(zv_test::run_program({noti}), 2);
+    EXPECT_EQ(zv_test::run_program({noti, "show"}), 2);
+    EXPECT_EQ(zv_test::run_program({noti, "list", "extra"}), 2);
+    EXPECT_EQ(zv_test::run_program({noti, "--help"}, "", &out), 0);
+    EXPECT_NE(out.find("zv-noti list"), std::string::npos);
 
-    // A negative progress keeps what the notification had.
-    zuvo_ext_noti_ongoing_noti_update("Uploading", "b.mp4", 1, 2, -1.0);
-    Keys k = keys(kOngoing);
-    EXPECT_EQ(k["content"], "b.mp4");
-    EXPECT_EQ(k["event_count"], "[1/2]");
-    EXPECT_EQ(k["display_applist"], "1");
-    EXPECT_DOUBLE_EQ(g_ascii_strtod(k["progress"].c_str(), nullptr), 0.25);
-}
-
-TEST_F(NotiTest, OngoingPostedByOneProcessIsUpdatedAndRemovedByAnother)
-{
     pid_t pid = fork();
     ASSERT_GE(pid, 0);
     if (pid == 0)
@@ -120,23 +101,24 @@ TEST_F(NotiTest, OngoingPostedByOneProcessIsUpdatedAndRemovedByAnother)
     int status = 0;
     ASSERT_EQ(waitpid(pid, &status, 0), pid);
     ASSERT_TRUE(WIFEXITED(status) && WEXITSTATUS(status) == 0);
-    ASSERT_TRUE(posted(kOngoing));
-
     zuvo_ext_noti_ongoing_noti_update("Uploading", "second.mp4", 0, 1, 0.6);
     EXPECT_FALSE(g_log.logged("So, create it."));
-    EXPECT_EQ(keys(kOngoing)["content"], "second.mp4");
-
-    std::string listing;
-    ASSERT_EQ(zv_test::run_program({zv_test::bin_path("zv-noti"), "list"}, "", &listing), 0);
-    EXPECT_NE(listing.find(std::string("[") + kOngoing + "]"), std::string::npos) << listing;
-    EXPECT_NE(listing.find("content=second.mp4"), std::string::npos) << listing;
+    ASSERT_EQ(zv_test::run_program({noti, "list"}, "", &out), 0);
+    EXPECT_NE(out.find(std::string("[") + kOngoing + "]"), std::string::npos) << out;
+    EXPECT_NE(out.find("content=second.mp4"), std::string::npos) << out;
 
     zuvo_ext_noti_ongoing_noti_destroy();
-    EXPECT_FALSE(posted(kOngoing));
-    g_log.mark();
+    EXPECT_EQ(tray(kOngoing), "");
     zuvo_ext_noti_ongoing_noti_destroy();
     EXPECT_TRUE(g_log.logged("\033[32m[TID:"));
     EXPECT_TRUE(g_log.logged("Zuvo Noti Ongoing Tag is not existed. ==="));
+
+    zuvo_ext_noti_ongoing_noti_update("Uploading", "a.mp4", 0, 2, 0.25);
+    EXPECT_TRUE(g_log.logged("ongoing_noti_h is NULL. So, create it."));
+    zuvo_ext_noti_ongoing_noti_update("Uploading", "b.mp4", 1, 2, -1.0);
+    EXPECT_EQ(tray(kOngoing), "content=b.mp4;disable_app_launch=false;display_applist=1;"
+                              "event_count=[1/2];launch_app_id=zuvo-upload-svc;progress=0.25;"
+                              "tag=zuvo_ongoing_noti;title=Uploading;type=ongoing;");
 }
 
 TEST_F(NotiTest, UnreadableTrayFileIsTakenAsAbsentAndLogged)
@@ -147,60 +129,36 @@ TEST_F(NotiTest, UnreadableTrayFileIsTakenAsAbsentAndLogged)
                             "[other]\ntype=noti\n"};
     double progress = 0.5;
     for (const char *text : broken) {
-        SCOPED_TRACE(text);
         ASSERT_TRUE(zv_test::write_file(tray_file(kOngoing), text));
         g_log.mark();
         progress += 0.1; // an update that changes nothing is not written again
         zuvo_ext_noti_ongoing_noti_update("Uploading", "b.mp4", 0, 1, progress);
-        EXPECT_TRUE(g_log.logged("is not a notification"));
-        EXPECT_TRUE(g_log.logged("ongoing_noti_h is NULL. So, create it."));
-        EXPECT_EQ(keys(kOngoing)["content"], "b.mp4");
+        EXPECT_TRUE(g_log.logged("is not a notification")) << text;
+        EXPECT_TRUE(g_log.logged("ongoing_noti_h is NULL. So, create it.")) << text;
+        EXPECT_NE(tray(kOngoing).find("content=b.mp4;"), std::string::npos) << text;
     }
 }
 
-TEST_F(NotiTest, CompletionReplacesOngoingAndOpensNothing)
+// The completion notification replaces the ongoing one, opens nothing and stays in the tray
+// when its handle is released; status messages are appended one a line.
+TEST_F(NotiTest, CompletionReplacesOngoingOpensNothingAndStays)
 {
     ASSERT_TRUE(zuvo_ext_noti_ongoing_noti_create("Uploading", "a.mp4", 1, 2, 0.5));
     ASSERT_EQ(zuvo_ext_noti_complete_noti_create("Uploaded", "2 files"), 1);
-    EXPECT_FALSE(posted(kOngoing));
-    Keys k = keys(kComplete);
-    EXPECT_EQ(k["type"], "noti");
-    EXPECT_EQ(k["title"], "Uploaded");
-    EXPECT_EQ(k["content"], "2 files");
-    EXPECT_EQ(k["display_applist"], "11");
-    EXPECT_EQ(k["disable_app_launch"], "true");
-    EXPECT_EQ(k.count("launch_app_id"), 0u);
-    EXPECT_EQ(k.count("progress"), 0u);
-    EXPECT_GT(g_ascii_strtoll(k["time"].c_str(), nullptr, 10), 0);
-
-    // Destroy releases the handle only: the notification stays in the tray.
+    EXPECT_EQ(tray(kOngoing), "");
+    const std::string complete = "content=2 files;disable_app_launch=true;display_applist=11;"
+                                 "event_count=;tag=zuvo_complete_noti;time=set;title=Uploaded;"
+                                 "type=noti;";
+    EXPECT_EQ(tray(kComplete), complete);
     zuvo_ext_noti_complete_noti_destroy();
-    EXPECT_TRUE(posted(kComplete));
-    g_log.mark();
+    EXPECT_EQ(tray(kComplete), complete);
     zuvo_ext_noti_complete_noti_destroy();
     EXPECT_TRUE(g_log.logged("noti handle is NULL"));
-}
 
-TEST_F(NotiTest, StatusMessagesAreAppendedOneALine)
-{
     zuvo_ext_noti_message_post("first");
     zuvo_ext_noti_message_post("second\nline");
     EXPECT_EQ(zv_test::read_file(dir_.file("run/notifications/status-messages.log")),
               "first\nsecond line\n");
-}
-
-TEST_F(NotiTest, ZvNotiRejectsWrongCalls)
-{
-    const std::string noti = zv_test::bin_path("zv-noti");
-    EXPECT_EQ(zv_test::run_program({noti}), 2);
-    EXPECT_EQ(zv_test::run_program({noti, "show"}), 2);
-    EXPECT_EQ(zv_test::run_program({noti, "list", "extra"}), 2);
-    std::string help;
-    EXPECT_EQ(zv_test::run_program({noti, "--help"}, "", &help), 0);
-    EXPECT_NE(help.find("zv-noti list"), std::string::npos);
-    std::string empty;
-    EXPECT_EQ(zv_test::run_program({noti, "list"}, "", &empty), 0);
-    EXPECT_EQ(empty, "");
 }
 
 } // namespace

@@ -9,13 +9,10 @@
 #include "zv-test-util.h"
 #include "zv-upload-main.h"
 
-using zv_test::TempDir;
-using zv_test::wait_for;
-
 namespace
 {
 
-TEST(ExtUtilContext, FirstContextStays)
+TEST(ExtUtil, FirstContextStaysFileSizesAndTheIdIsTheTime)
 {
     static AppData first, second;
     zv_ext_util_set_appdata(nullptr);
@@ -23,89 +20,70 @@ TEST(ExtUtilContext, FirstContextStays)
     zv_ext_util_set_appdata(&first);
     zv_ext_util_set_appdata(&second);
     EXPECT_EQ(zv_ext_util_get_appdata(), &first);
-}
 
-TEST(ExtUtilFile, SizeOfFiles)
-{
-    TempDir tmp;
-    ASSERT_TRUE(zv_test::write_file(tmp.file("empty"), ""));
+    zv_test::TempDir tmp;
     ASSERT_TRUE(zv_test::write_file(tmp.file("five"), "12345"));
     ASSERT_TRUE(zv_test::write_file(tmp.file("video"), ""));
+    EXPECT_EQ(zv_ext_util_get_file_size(tmp.file("video").c_str()), 0);
     ASSERT_EQ(truncate(tmp.file("video").c_str(), 5000000000LL), 0); // sparse, past 4 GiB
-    EXPECT_EQ(zv_ext_util_get_file_size(tmp.file("empty").c_str()), 0);
     EXPECT_EQ(zv_ext_util_get_file_size(tmp.file("five").c_str()), 5);
     EXPECT_EQ(zv_ext_util_get_file_size(tmp.file("video").c_str()), 5000000000LL);
     EXPECT_EQ(zv_ext_util_get_file_size(tmp.file("missing").c_str()), -1);
     EXPECT_EQ(zv_ext_util_get_file_size(nullptr), -1);
-}
 
-TEST(ExtUtilId, IsTheCurrentTime)
-{
     time_t before = time(nullptr);
     time_t id = zv_ext_util_generate_id();
-    time_t after = time(nullptr);
     EXPECT_GE(id, before);
-    EXPECT_LE(id, after);
+    EXPECT_LE(id, time(nullptr));
 }
 
-class ExtUtilPopup : public ::testing::Test
-{
-  protected:
-    void SetUp() override
+struct ExtUtilPopup : ::testing::Test {
+    ExtUtilPopup()
     {
-        win = elm_win_add(nullptr, "zv-ext-util-test", ELM_WIN_BASIC);
         evas_object_resize(win, 360, 640);
         evas_object_show(win);
     }
-    void TearDown() override { evas_object_del(win); }
-
+    ~ExtUtilPopup() override { evas_object_del(win); }
     static void count_cb(void *data, Evas_Object *, void *) { ++*static_cast<int *>(data); }
 
-    Evas_Object *win = nullptr;
+    Evas_Object *win = elm_win_add(nullptr, "zv-ext-util-test", ELM_WIN_BASIC);
     int calls = 0;
 };
 
-TEST_F(ExtUtilPopup, NullArgumentsGiveNoPopup)
+// The message popup and the processing popup with a timeout call back once it passes; the
+// processing popup without one stays, its one row a "1line" item.
+TEST_F(ExtUtilPopup, PopupsTimeOutWhenTheyHaveATimeout)
 {
-    EXPECT_EQ(zv_ext_util_create_popup(nullptr, "t", 1.0, count_cb, &calls), nullptr);
-    EXPECT_EQ(zv_ext_util_create_popup(win, "t", 1.0, count_cb, nullptr), nullptr);
-    EXPECT_EQ(zv_ext_util_create_list_popup(nullptr, "t", 1.0, count_cb, &calls), nullptr);
-    EXPECT_EQ(zv_ext_util_create_list_popup(win, "t", 1.0, count_cb, nullptr), nullptr);
+    for (auto create : {zv_ext_util_create_popup, zv_ext_util_create_list_popup}) {
+        EXPECT_EQ(create(nullptr, "t", 1.0, count_cb, &calls), nullptr);
+        EXPECT_EQ(create(win, "t", 1.0, count_cb, nullptr), nullptr);
+    }
     EXPECT_EQ(zv_ext_util_create_account_select_popup(nullptr, "t", nullptr, count_cb, &calls),
               nullptr);
     EXPECT_EQ(zv_ext_util_create_account_select_popup(win, "t", nullptr, count_cb, nullptr),
               nullptr);
     zv_ext_util_destroy_popup(nullptr);
-}
 
-TEST_F(ExtUtilPopup, MessagePopupTimesOut)
-{
-    Evas_Object *popup = zv_ext_util_create_popup(win, "Saved", 0.05, count_cb, &calls);
-    ASSERT_NE(popup, nullptr);
-    EXPECT_STREQ(elm_object_text_get(popup), "Saved");
-    EXPECT_TRUE(wait_for([&] { return calls == 1; }));
-    zv_ext_util_destroy_popup(popup);
-}
-
-TEST_F(ExtUtilPopup, ProcessingPopupTimeoutIsOptional)
-{
+    Evas_Object *message = zv_ext_util_create_popup(win, "Saved", 0.05, count_cb, &calls);
+    ASSERT_NE(message, nullptr);
+    EXPECT_STREQ(elm_object_text_get(message), "Saved");
+    EXPECT_TRUE(zv_test::wait_for([&] { return calls == 1; }));
     Evas_Object *kept = zv_ext_util_create_list_popup(win, "Working", 0.0, count_cb, &calls);
     ASSERT_NE(kept, nullptr);
     EXPECT_EQ(elm_popup_timeout_get(kept), 0.0);
     Evas_Object *timed = zv_ext_util_create_list_popup(win, "Working", 0.05, count_cb, &calls);
     ASSERT_NE(timed, nullptr);
-    EXPECT_TRUE(wait_for([&] { return calls == 1; }));
+    EXPECT_TRUE(zv_test::wait_for([&] { return calls == 2; }));
 
-    Evas_Object *box = elm_object_content_get(kept);
-    Eina_List *children = elm_box_children_get(box);
+    Eina_List *children = elm_box_children_get(elm_object_content_get(kept));
     ASSERT_EQ(eina_list_count(children), 1u);
-    Evas_Object *genlist = static_cast<Evas_Object *>(eina_list_data_get(children));
+    auto *genlist = static_cast<Evas_Object *>(eina_list_data_get(children));
     eina_list_free(children);
     Elm_Object_Item *row = elm_genlist_first_item_get(genlist);
     EXPECT_STREQ(elm_genlist_item_item_class_get(row)->item_style, "1line");
-    EXPECT_EQ(calls, 1);
-    zv_ext_util_destroy_popup(kept);
-    zv_ext_util_destroy_popup(timed);
+    EXPECT_EQ(calls, 2);
+    for (Evas_Object *popup : {message, kept, timed})
+        zv_ext_util_destroy_popup(popup);
 }
 
 TEST_F(ExtUtilPopup, AccountPopupNumbersRowsPastNullEntries)
@@ -114,10 +92,7 @@ TEST_F(ExtUtilPopup, AccountPopupNumbersRowsPastNullEntries)
     account_info a = {}, b = {};
     a.display_name = name_a;
     b.display_name = name_b;
-    GList *accounts = g_list_append(nullptr, &a);
-    accounts = g_list_append(accounts, nullptr);
-    accounts = g_list_append(accounts, &b);
-
+    GList *accounts = g_list_append(g_list_append(g_list_append(nullptr, &a), nullptr), &b);
     account_info *chosen = nullptr;
     auto select_cb = [](void *data, Evas_Object *, void *) {
         auto *account = static_cast<account_info *>(data);
@@ -130,7 +105,6 @@ TEST_F(ExtUtilPopup, AccountPopupNumbersRowsPastNullEntries)
     EXPECT_EQ(a.position, 0);
     EXPECT_EQ(b.position, 2);
     EXPECT_EQ(b.user_data, &chosen);
-
     Evas_Object *genlist = elm_object_content_get(popup);
     ASSERT_EQ(elm_genlist_items_count(genlist), 2u);
     elm_genlist_item_selected_set(elm_genlist_last_item_get(genlist), EINA_TRUE);

@@ -16,18 +16,15 @@ using namespace zv_test;
 TEST(KeyStorage, SetMakesPrivateEntriesThatReadBack)
 {
     TempDir tmp;
-    ASSERT_EQ(key_storage_set("zuvo.tizen.api.key", "AIza-secret"), KEY_STORAGE_ERROR_NONE);
     struct stat sb;
-    ASSERT_EQ(stat(tmp.file("keys").c_str(), &sb), 0);
-    EXPECT_EQ(sb.st_mode & 0777, 0700u);
-    ASSERT_EQ(stat(tmp.file("keys/zuvo.tizen.api.key").c_str(), &sb), 0);
-    EXPECT_EQ(sb.st_mode & 0777, 0600u);
-
-    const char *values[] = {"AIza-secret", "", "ends with newline\n"};
-    for (const char *v : values) {
-        ASSERT_EQ(key_storage_set("k", v), KEY_STORAGE_ERROR_NONE);
+    for (const char *v : {"AIza-secret", "", "ends with newline\n"}) {
+        ASSERT_EQ(key_storage_set("zuvo.tizen.api.key", v), KEY_STORAGE_ERROR_NONE);
+        ASSERT_EQ(stat(tmp.file("keys").c_str(), &sb), 0);
+        EXPECT_EQ(sb.st_mode & 0777, 0700u);
+        ASSERT_EQ(stat(tmp.file("keys/zuvo.tizen.api.key").c_str(), &sb), 0);
+        EXPECT_EQ(sb.st_mode & 0777, 0600u);
         char *got = nullptr;
-        ASSERT_EQ(key_storage_get("k", &got), KEY_STORAGE_ERROR_NONE);
+        ASSERT_EQ(key_storage_get("zuvo.tizen.api.key", &got), KEY_STORAGE_ERROR_NONE);
         EXPECT_STREQ(got, v);
         free(got);
     }
@@ -37,11 +34,24 @@ TEST(KeyStorage, SetMakesPrivateEntriesThatReadBack)
     EXPECT_EQ(key_storage_get("../keys/k", &got), KEY_STORAGE_ERROR_INVALID_PARAMETER);
 }
 
-TEST(KeyStorage, OpenFileOrFolderIsRefusedWithReason)
+// The tool, another process, keeps entries, refuses open ones and says why in the log and
+// in its one-line answer, and answers wrong calls with status 2.
+TEST(KeyStorageTool, KeepsEntriesRefusesOpenOnesAndWrongCalls)
 {
     TempDir tmp;
-    std::string log = tmp.file("dlog");
-    ASSERT_EQ(key_storage_set("zuvo.tizen.client.id", "id"), KEY_STORAGE_ERROR_NONE);
+    const std::string tool = bin_path("zv-keystore"), log = tmp.file("dlog");
+    std::string out;
+    ASSERT_EQ(run_program({tool, "set", "zuvo.tizen.client.id"}, "s3cret\n"), 0);
+    ASSERT_EQ(run_program({tool, "get", "zuvo.tizen.client.id"}, "", &out), 0);
+    EXPECT_EQ(out, "s3cret\n");
+    EXPECT_EQ(run_program({tool, "get", "absent"}), 1);
+    EXPECT_EQ(run_program({tool, "--help"}, "", &out), 0);
+    for (const char *args : {"", "get", "set", "get a b", "list", "get a/b"}) {
+        std::string cmd = tool + " " + args + " 2>&1 </dev/null";
+        EXPECT_EQ(run_program({"/bin/sh", "-c", cmd}, "", &out), 2) << cmd;
+        EXPECT_EQ(std::count(out.begin(), out.end(), '\n'), 1) << out;
+    }
+
     const struct {
         const char *path;
         mode_t mode;
@@ -53,45 +63,22 @@ TEST(KeyStorage, OpenFileOrFolderIsRefusedWithReason)
         {"keys", 0701, "key storage folder"},
     };
     for (const auto &c : cases) {
-        chmod(tmp.file(c.path).c_str(), c.mode);
+        SCOPED_TRACE(c.mode);
+        ASSERT_EQ(chmod(tmp.file(c.path).c_str(), c.mode), 0);
         char *got = nullptr;
         EXPECT_EQ(key_storage_get("zuvo.tizen.client.id", &got),
-                  KEY_STORAGE_ERROR_PERMISSION_DENIED)
-            << c.path << " " << std::oct << c.mode;
+                  KEY_STORAGE_ERROR_PERMISSION_DENIED);
         EXPECT_EQ(got, nullptr);
-
-        // The tool says why, in the log and in its one-line answer.
         unlink(log.c_str());
         setenv("ZV_DLOG_FILE", log.c_str(), 1);
-        std::string out;
-        EXPECT_EQ(run_program(
-                      {"/bin/sh", "-c", bin_path("zv-keystore") + " get zuvo.tizen.client.id 2>&1"},
-                      "", &out),
+        EXPECT_EQ(run_program({"/bin/sh", "-c", tool + " get zuvo.tizen.client.id 2>&1"}, "", &out),
                   1);
         unsetenv("ZV_DLOG_FILE");
-        EXPECT_NE(read_file(log).find(std::string(c.reason) + " " + tmp.file(c.path)),
-                  std::string::npos)
-            << read_file(log);
-        EXPECT_NE(read_file(log).find("open to group or others"), std::string::npos);
         EXPECT_NE(out.find("refused"), std::string::npos) << out;
+        const std::string logged = read_file(log);
+        EXPECT_NE(logged.find(std::string(c.reason) + " " + tmp.file(c.path)), std::string::npos)
+            << logged;
+        EXPECT_NE(logged.find("open to group or others"), std::string::npos);
         chmod(tmp.file(c.path).c_str(), c.path == std::string("keys") ? 0700 : 0600);
     }
-}
-
-TEST(KeyStorageTool, SetGetAndWrongCalls)
-{
-    TempDir tmp;
-    std::string tool = bin_path("zv-keystore");
-    std::string out;
-    ASSERT_EQ(run_program({tool, "set", "zuvo.tizen.client.secret"}, "s3cret\n"), 0);
-    ASSERT_EQ(run_program({tool, "get", "zuvo.tizen.client.secret"}, "", &out), 0);
-    EXPECT_EQ(out, "s3cret\n");
-    EXPECT_EQ(run_program({tool, "get", "absent"}), 1);
-    const std::vector<std::string> wrong = {"", "get", "set", "get a b", "list", "get a/b"};
-    for (const auto &args : wrong) {
-        std::string cmd = tool + " " + args + " 2>&1 </dev/null";
-        EXPECT_EQ(run_program({"/bin/sh", "-c", cmd}, "", &out), 2) << cmd;
-        EXPECT_EQ(std::count(out.begin(), out.end(), '\n'), 1) << out;
-    }
-    EXPECT_EQ(run_program({tool, "--help"}, "", &out), 0);
 }

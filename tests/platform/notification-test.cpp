@@ -10,7 +10,6 @@
 #include <signal.h>
 #include <stdlib.h>
 #include <sys/resource.h>
-#include <sys/wait.h>
 #include <unistd.h>
 
 #include <algorithm>
@@ -25,46 +24,31 @@ namespace
 
 using zv_test::wait_for;
 
-struct NotifyCall {
-    uint32_t replaces_id;
-    std::string summary;
-    std::string body;
-    std::string actions; // "key,label,..."
-    int value;           // the progress hint, -1 without one
-};
-
-struct DesktopService {
-    bool owned = false;
-    uint32_t next_id = 41;
-    std::vector<NotifyCall> notifies;
-    std::vector<uint32_t> closed;
-};
-
-DesktopService g_service;
+// The stand-in's calls: "replaces_id|summary|body|actions|value" per Notify (actions comma
+// separated, value the progress hint or -1), "close ID" per CloseNotification.
+std::vector<std::string> g_calls;
+bool g_owned = false;
 
 Eldbus_Message *on_notify(const Eldbus_Service_Interface *, const Eldbus_Message *msg)
 {
-    const char *app = nullptr, *icon = nullptr, *summary = nullptr, *body = nullptr;
+    static uint32_t next_id = 41;
+    const char *app, *icon, *summary, *body, *text, *key;
     uint32_t replaces = 0;
-    int32_t timeout = 0;
-    Eldbus_Message_Iter *actions = nullptr, *hints = nullptr;
+    int32_t timeout = 0, value = -1;
+    Eldbus_Message_Iter *actions, *hints, *entry, *variant;
     if (!eldbus_message_arguments_get(msg, "susssasa{sv}i", &app, &replaces, &icon, &summary, &body,
                                       &actions, &hints, &timeout))
         return eldbus_message_error_new(msg, "org.freedesktop.DBus.Error.InvalidArgs", "args");
-    NotifyCall call{replaces, summary, body, "", -1};
-    const char *text = nullptr;
-    while (eldbus_message_iter_get_and_next(actions, 's', &text))
-        call.actions += (call.actions.empty() ? "" : ",") + std::string(text);
-    Eldbus_Message_Iter *entry = nullptr, *variant = nullptr;
-    while (eldbus_message_iter_get_and_next(hints, 'e', &entry)) {
-        const char *key = nullptr;
+    std::string call = std::to_string(replaces) + "|" + summary + "|" + body + "|";
+    for (const char *sep = ""; eldbus_message_iter_get_and_next(actions, 's', &text); sep = ",")
+        call += sep + std::string(text);
+    while (eldbus_message_iter_get_and_next(hints, 'e', &entry))
         if (eldbus_message_iter_arguments_get(entry, "sv", &key, &variant) &&
-            !strcmp(key, "value") && !eldbus_message_iter_arguments_get(variant, "i", &call.value))
-            call.value = -2;
-    }
-    g_service.notifies.push_back(call);
+            !strcmp(key, "value") && !eldbus_message_iter_arguments_get(variant, "i", &value))
+            value = -2;
+    g_calls.push_back(call + "|" + std::to_string(value));
     Eldbus_Message *reply = eldbus_message_method_return_new(msg);
-    eldbus_message_arguments_append(reply, "u", replaces ? replaces : g_service.next_id++);
+    eldbus_message_arguments_append(reply, "u", replaces ? replaces : next_id++);
     return reply;
 }
 
@@ -72,7 +56,7 @@ Eldbus_Message *on_close(const Eldbus_Service_Interface *, const Eldbus_Message 
 {
     uint32_t id = 0;
     if (eldbus_message_arguments_get(msg, "u", &id))
-        g_service.closed.push_back(id);
+        g_calls.push_back("close " + std::to_string(id));
     return eldbus_message_method_return_new(msg);
 }
 
@@ -84,14 +68,23 @@ const Eldbus_Method kMethods[] = {
     {"CloseNotification", ELDBUS_ARGS({"u", "id"}), nullptr, on_close, 0},
     {nullptr, nullptr, nullptr, nullptr, 0},
 };
-
 const Eldbus_Signal kSignals[] = {
     {"ActionInvoked", ELDBUS_ARGS({"u", "id"}, {"s", "action_key"}), 0},
     {nullptr, nullptr, 0},
 };
-
 const Eldbus_Service_Interface_Desc kInterface = {
     "org.freedesktop.Notifications", kMethods, kSignals, nullptr, nullptr, nullptr};
+
+notification_h make(notification_type_e type, const char *tag, const char *content)
+{
+    notification_h noti = notification_create(type);
+    notification_set_text(noti, NOTIFICATION_TEXT_TYPE_TITLE, "Uploading", nullptr,
+                          NOTIFICATION_VARIABLE_TYPE_NONE);
+    notification_set_text(noti, NOTIFICATION_TEXT_TYPE_CONTENT, content, nullptr,
+                          NOTIFICATION_VARIABLE_TYPE_NONE);
+    notification_set_tag(noti, tag);
+    return noti;
+}
 
 class DesktopNotificationTest : public ::testing::Test
 {
@@ -111,70 +104,56 @@ class DesktopNotificationTest : public ::testing::Test
             conn_, "org.freedesktop.Notifications", ELDBUS_NAME_REQUEST_FLAG_DO_NOT_QUEUE,
             [](void *, const Eldbus_Message *msg, Eldbus_Pending *) {
                 unsigned reply = 0;
-                g_service.owned = !eldbus_message_error_get(msg, nullptr, nullptr) &&
-                                  eldbus_message_arguments_get(msg, "u", &reply) &&
-                                  reply == ELDBUS_NAME_REQUEST_REPLY_PRIMARY_OWNER;
+                g_owned = !eldbus_message_error_get(msg, nullptr, nullptr) &&
+                          eldbus_message_arguments_get(msg, "u", &reply) &&
+                          reply == ELDBUS_NAME_REQUEST_REPLY_PRIMARY_OWNER;
             },
             nullptr);
-        wait_for([] { return g_service.owned; }, 10000);
+        wait_for([] { return g_owned; }, 10000);
     }
-
     static void TearDownTestSuite()
     {
         if (conn_)
             eldbus_connection_unref(conn_);
         delete dir_;
     }
-
     void SetUp() override
     {
-        if (!g_service.owned)
+        if (!g_owned)
             GTEST_SKIP() << "runs on a private session bus (dbus-run-session)";
+        g_calls.clear();
     }
-
-    // The desktop's click on a notification.
-    static void click(uint32_t id) { eldbus_service_signal_emit(iface_, 0, id, "default"); }
-
-    static zv_test::TempDir *dir_;
-    static Eldbus_Connection *conn_;
-    static Eldbus_Service_Interface *iface_;
+    // The id the service gave to the notification of tag, as the notifier keeps it.
+    static std::string id_file(const char *tag)
+    {
+        return dir_->file(std::string("run/notifications/desktop/") + tag);
+    }
+    static inline zv_test::TempDir *dir_ = nullptr;
+    static inline Eldbus_Connection *conn_ = nullptr;
+    static inline Eldbus_Service_Interface *iface_ = nullptr;
 };
 
-zv_test::TempDir *DesktopNotificationTest::dir_ = nullptr;
-Eldbus_Connection *DesktopNotificationTest::conn_ = nullptr;
-Eldbus_Service_Interface *DesktopNotificationTest::iface_ = nullptr;
-
+// Updates made before the service has answered are sent once it has, as replacements of the
+// id it gave; a delete closes that id.
 TEST_F(DesktopNotificationTest, PostedNotificationIsShownReplacedAndClosed)
 {
-    notification_h noti = notification_create(NOTIFICATION_TYPE_ONGOING);
-    ASSERT_NE(noti, nullptr);
-    notification_set_text(noti, NOTIFICATION_TEXT_TYPE_TITLE, "Uploading", nullptr,
-                          NOTIFICATION_VARIABLE_TYPE_NONE);
-    notification_set_text(noti, NOTIFICATION_TEXT_TYPE_CONTENT, "a.mp4", nullptr,
-                          NOTIFICATION_VARIABLE_TYPE_NONE);
-    notification_set_tag(noti, "desktop_test");
+    notification_h noti = make(NOTIFICATION_TYPE_ONGOING, "desktop_test", "a.mp4");
     ASSERT_EQ(notification_post(noti), NOTIFICATION_ERROR_NONE);
-
-    // Updates made before the service has answered are sent once it has, as replacements.
-    notification_set_text(noti, NOTIFICATION_TEXT_TYPE_CONTENT, "b.mp4", nullptr,
-                          NOTIFICATION_VARIABLE_TYPE_NONE);
-    ASSERT_EQ(notification_update(noti), NOTIFICATION_ERROR_NONE);
-    notification_set_text(noti, NOTIFICATION_TEXT_TYPE_CONTENT, "c.mp4", nullptr,
-                          NOTIFICATION_VARIABLE_TYPE_NONE);
-    ASSERT_EQ(notification_update(noti), NOTIFICATION_ERROR_NONE);
-    ASSERT_TRUE(wait_for(
-        [] { return !g_service.notifies.empty() && g_service.notifies.back().body == "c.mp4"; }));
-    const uint32_t id = 41;
-    EXPECT_EQ(g_service.notifies.front().replaces_id, 0u);
-    EXPECT_EQ(g_service.notifies.front().summary, "Uploading");
-    for (size_t i = 1; i < g_service.notifies.size(); i++)
-        EXPECT_EQ(g_service.notifies[i].replaces_id, id) << i;
-    EXPECT_EQ(zv_test::read_file(dir_->file("run/notifications/desktop/desktop_test")), "41\n");
+    for (const char *content : {"b.mp4", "c.mp4"}) {
+        notification_set_text(noti, NOTIFICATION_TEXT_TYPE_CONTENT, content, nullptr,
+                              NOTIFICATION_VARIABLE_TYPE_NONE);
+        ASSERT_EQ(notification_update(noti), NOTIFICATION_ERROR_NONE);
+    }
+    ASSERT_TRUE(
+        wait_for([] { return !g_calls.empty() && g_calls.back() == "41|Uploading|c.mp4||-1"; }));
+    EXPECT_EQ(g_calls.front().substr(0, 12), "0|Uploading|");
+    for (size_t i = 1; i < g_calls.size(); i++)
+        EXPECT_EQ(g_calls[i].substr(0, 3), "41|") << g_calls[i];
+    EXPECT_EQ(zv_test::read_file(id_file("desktop_test")), "41\n");
 
     ASSERT_EQ(notification_delete(noti), NOTIFICATION_ERROR_NONE);
-    ASSERT_TRUE(wait_for([] { return !g_service.closed.empty(); }));
-    EXPECT_EQ(g_service.closed.back(), id);
-    EXPECT_NE(access(dir_->file("run/notifications/desktop/desktop_test").c_str(), F_OK), 0);
+    ASSERT_TRUE(wait_for([] { return g_calls.back() == "close 41"; }));
+    EXPECT_NE(access(id_file("desktop_test").c_str(), F_OK), 0);
     notification_free(noti);
 }
 
@@ -188,43 +167,36 @@ TEST_F(DesktopNotificationTest, ClickLaunchesTheApplication)
     pid_t app = zv_test::spawn_program({zv_test::bin_path("zv-app-probe")});
     ASSERT_TRUE(wait_for([&] { return zv_test::has_line(probe_log, "app_control"); }, 20000));
 
-    notification_h ongoing = notification_create(NOTIFICATION_TYPE_ONGOING);
+    notification_h ongoing = make(NOTIFICATION_TYPE_ONGOING, "click_ongoing", "a.mp4");
     app_control_h launch = nullptr;
     app_control_create(&launch);
     app_control_set_app_id(launch, "zuvo-upload-svc");
     notification_set_launch_option(ongoing, NOTIFICATION_LAUNCH_OPTION_APP_CONTROL, launch);
     app_control_destroy(launch);
     notification_set_progress(ongoing, 0.37);
-    notification_set_tag(ongoing, "click_ongoing");
-    notification_h done = notification_create(NOTIFICATION_TYPE_NOTI);
+    notification_h done = make(NOTIFICATION_TYPE_NOTI, "click_complete", "done");
     notification_set_property(done, NOTIFICATION_PROP_DISABLE_APP_LAUNCH);
-    notification_set_tag(done, "click_complete");
-    g_service.notifies.clear();
     ASSERT_EQ(notification_post(ongoing), NOTIFICATION_ERROR_NONE);
     ASSERT_EQ(notification_post(done), NOTIFICATION_ERROR_NONE);
-    ASSERT_TRUE(wait_for([] { return g_service.notifies.size() == 2; }));
-    EXPECT_EQ(g_service.notifies[0].actions, "default,Open");
-    EXPECT_EQ(g_service.notifies[0].value, 37);
-    EXPECT_EQ(g_service.notifies[1].actions, "");
-    // The ids the service gave, as the notifier keeps them.
-    auto id = [](const char *tag) {
-        std::string file = dir_->file(std::string("run/notifications/desktop/") + tag);
-        EXPECT_TRUE(wait_for([&] { return access(file.c_str(), F_OK) == 0; }));
-        return (uint32_t)g_ascii_strtoull(zv_test::read_file(file).c_str(), nullptr, 10);
-    };
+    ASSERT_TRUE(wait_for([] { return g_calls.size() == 2; }));
+    EXPECT_EQ(g_calls[0], "0|Uploading|a.mp4|default,Open|37");
+    EXPECT_EQ(g_calls[1], "0|Uploading|done||-1");
     auto launches = [&] {
         auto lines = zv_test::read_lines(probe_log);
         return std::count(lines.begin(), lines.end(), "app_control");
     };
-    click(id("click_complete"));
-    click(id("click_ongoing"));
+    for (const char *tag : {"click_complete", "click_ongoing"}) {
+        ASSERT_TRUE(wait_for([&] { return access(id_file(tag).c_str(), F_OK) == 0; }));
+        uint32_t id = g_ascii_strtoull(zv_test::read_file(id_file(tag)).c_str(), nullptr, 10);
+        eldbus_service_signal_emit(iface_, 0, id, "default");
+    }
     EXPECT_TRUE(wait_for([&] { return launches() == 2; }, 10000));
     EXPECT_FALSE(wait_for([&] { return launches() > 2; }, 500));
 
-    notification_delete(ongoing);
-    notification_delete(done);
-    notification_free(ongoing);
-    notification_free(done);
+    for (notification_h n : {ongoing, done}) {
+        notification_delete(n);
+        notification_free(n);
+    }
     kill(app, SIGTERM);
     EXPECT_EQ(zv_test::wait_program(app), 0);
     unsetenv("ZV_PROBE_LOG");
@@ -235,16 +207,11 @@ TEST_F(DesktopNotificationTest, ClickLaunchesTheApplication)
 TEST(TrayFile, UnwrittenNotificationLandsLaterUnlessDeleted)
 {
     zv_test::TempDir dir;
-    auto posted = [&](const char *tag) {
-        return access(dir.file(std::string("run/notifications/") + tag + ".ini").c_str(), F_OK) ==
-               0;
+    auto posted = [&](const std::string &tag) {
+        return access(dir.file("run/notifications/" + tag + ".ini").c_str(), F_OK) == 0;
     };
-    notification_h late = notification_create(NOTIFICATION_TYPE_ONGOING);
-    notification_h gone = notification_create(NOTIFICATION_TYPE_ONGOING);
-    notification_set_tag(late, "late");
-    notification_set_tag(gone, "gone");
-    notification_set_text(late, NOTIFICATION_TEXT_TYPE_TITLE, "Uploading", nullptr,
-                          NOTIFICATION_VARIABLE_TYPE_NONE);
+    notification_h late = make(NOTIFICATION_TYPE_ONGOING, "late", "a.mp4");
+    notification_h gone = make(NOTIFICATION_TYPE_ONGOING, "gone", "b.mp4");
     rlimit saved;
     ASSERT_EQ(getrlimit(RLIMIT_NOFILE, &saved), 0);
     rlimit none = saved;
