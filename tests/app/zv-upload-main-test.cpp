@@ -12,7 +12,7 @@
 #include <sstream>
 #include <string>
 
-#include "zv-app-test-util.h"
+#include "zv-test-util.h"
 #include "zv-upload-view.h"
 
 // The entry's own functions are file-local: the test compiles the file in.
@@ -248,9 +248,10 @@ TEST(UploadMainProgram, RunsAsInstanceTakesLaterLaunchesAndEndsOnSigterm)
     TempDir tmp;
     const std::string svc = bin_path("zuvo-upload-svc");
     process_log.mark();
-    pid_t pid = spawn_program({svc, "--extra", "ZV_DATA_ACCESS_TOKEN=t", "--extra",
-                               "ZV_DATA_CATEGORY=Music", "--extra", "ZV_DATA_ACCESS_TYPE=0"});
-    ASSERT_GT(pid, 0);
+    Child instance;
+    ASSERT_TRUE(instance.start({svc, "--extra", "ZV_DATA_ACCESS_TOKEN=t", "--extra",
+                                "ZV_DATA_CATEGORY=Music", "--extra", "ZV_DATA_ACCESS_TYPE=0"}));
+    const pid_t pid = instance.pid();
     ASSERT_TRUE(wait_for([&] { return logged_by(pid, "_app_resume"); }, 30000))
         << process_log.since_mark();
 
@@ -262,8 +263,9 @@ TEST(UploadMainProgram, RunsAsInstanceTakesLaterLaunchesAndEndsOnSigterm)
     EXPECT_TRUE(logged_by(pid, "app_control_get_extra_data error : -126"));
     EXPECT_EQ(run_program({svc, "--extra", "broken"}), 2);
 
-    kill(pid, SIGTERM);
-    EXPECT_EQ(wait_program(pid), 0);
+    instance.signal(SIGTERM);
+    ASSERT_TRUE(instance.wait_exit(20000));
+    EXPECT_EQ(instance.exit_status(), 0);
     EXPECT_TRUE(logged_by(pid, "_app_terminate"));
     EXPECT_TRUE(logged_by(pid, "ui_app_main() loop"));
 }
