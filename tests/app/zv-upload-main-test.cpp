@@ -39,9 +39,7 @@ bool logged_by(pid_t pid, const std::string &text)
     return false;
 }
 
-using Extras = std::vector<std::pair<const char *, const char *>>;
-
-app_control_h make_request(const Extras &extras)
+app_control_h make_request(const std::vector<std::pair<const char *, const char *>> &extras)
 {
     app_control_h h = nullptr;
     app_control_create(&h);
@@ -50,9 +48,14 @@ app_control_h make_request(const Extras &extras)
     return h;
 }
 
-std::string str(const char *s)
+// The batch settings as "token category description tag access_type use_location".
+std::string batch(const AppData &ad)
 {
-    return s ? s : "(null)";
+    std::ostringstream out;
+    for (const char *s : {ad.access_token, ad.category, ad.description, ad.tag})
+        out << (s ? s : "-") << " ";
+    out << ad.access_type << " " << ad.use_location;
+    return out.str();
 }
 
 } // namespace
@@ -64,88 +67,42 @@ TEST(UploadMainExtras, ReadingRules)
                *type = "ZV_DATA_ACCESS_TYPE";
     const char *missing = "app_control_get_extra_data error : -126";
     const struct {
-        Extras extras;
-        bool ok;
-        const char *message; // logged on failure
-        const char *token, *category, *description, *tag;
-        int access_type;
-        bool use_location;
+        std::vector<std::pair<const char *, const char *>> extras;
+        const char *failure; // logged when the request is refused
+        const char *batch;
     } cases[] = {
+        // every extra
         {{{tok, "tok"},
           {cat, "Music"},
-          {"ZV_DATA_DESCRIPTION", "desc"},
+          {"ZV_DATA_DESCRIPTION", "d"},
           {"ZV_DATA_TAG", "a,b"},
           {type, "2"}},
-         true,
          nullptr,
-         "tok",
-         "Music",
-         "desc",
-         "a,b",
-         2,
-         false},
-        {{{tok, "t2"}, {cat, "People"}, {type, "1"}},
-         true,
-         nullptr,
-         "t2",
-         "People",
-         nullptr,
-         nullptr,
-         1,
-         false},
-        {{{tok, "t3"}, {cat, "Pets"}, {type, "x"}},
-         true,
-         nullptr,
-         "t3",
-         "Pets",
-         nullptr,
-         nullptr,
-         0,
-         false},
-        {{{tok, "t4"}, {cat, "Cars"}}, false, missing, "t3", "Pets", nullptr, nullptr, 0, false},
-        {{{cat, "Cars"}, {type, "1"}},
-         false,
-         "app_control_get_extra_data error: -126",
-         "t3",
-         "Pets",
-         nullptr,
-         nullptr,
-         0,
-         false},
-        {{{tok, "t5"}, {type, "1"}}, false, missing, "t3", "Pets", nullptr, nullptr, 0, false},
+         "tok Music d a,b 2 0"},
+        // the optional ones absent
+        {{{tok, "t2"}, {cat, "People"}, {type, "1"}}, nullptr, "t2 People - - 1 0"},
+        // an access type that is not a number
+        {{{tok, "t3"}, {cat, "Pets"}, {type, "x"}}, nullptr, "t3 Pets - - 0 0"},
+        // no access type, no token, no category: the batch stays
+        {{{tok, "t4"}, {cat, "Cars"}}, missing, "t3 Pets - - 0 0"},
+        {{{cat, "Cars"}, {type, "1"}}, "app_control_get_extra_data error: -126", "t3 Pets - - 0 0"},
+        {{{tok, "t5"}, {type, "1"}}, missing, "t3 Pets - - 0 0"},
+        // the location on, and "0" is off
         {{{tok, "t6"}, {cat, "Pets"}, {type, "0"}, {"ZV_DATA_USE_LOCATION", "true"}},
-         true,
          nullptr,
-         "t6",
-         "Pets",
-         nullptr,
-         nullptr,
-         0,
-         true},
+         "t6 Pets - - 0 1"},
         {{{tok, "t7"}, {cat, "Pets"}, {type, "0"}, {"ZV_DATA_USE_LOCATION", "0"}},
-         true,
          nullptr,
-         "t7",
-         "Pets",
-         nullptr,
-         nullptr,
-         0,
-         false},
+         "t7 Pets - - 0 0"},
     };
     AppData ad{};
     for (const auto &c : cases) {
-        SCOPED_TRACE(&c - cases);
         app_control_h h = make_request(c.extras);
         process_log.mark();
-        EXPECT_EQ(_zv_upload_main_get_app_control_info(h, &ad), c.ok);
+        EXPECT_EQ(_zv_upload_main_get_app_control_info(h, &ad), !c.failure) << c.batch;
         app_control_destroy(h);
-        EXPECT_TRUE(!c.message || logged_by(getpid(), c.message)) << process_log.since_mark();
-        EXPECT_EQ(str(ad.access_token), str(c.token));
-        EXPECT_EQ(str(ad.category), str(c.category));
-        EXPECT_EQ(str(ad.description), str(c.description));
-        EXPECT_EQ(str(ad.tag), str(c.tag));
-        EXPECT_EQ(ad.access_type, c.access_type);
-        EXPECT_EQ(ad.use_location, c.use_location);
+        EXPECT_TRUE(!c.failure || logged_by(getpid(), c.failure)) << process_log.since_mark();
+        EXPECT_EQ(batch(ad), c.batch);
     }
     free(ad.access_token);
     free(ad.category);
@@ -165,11 +122,10 @@ TEST(UploadMainApp, CreateBuildsTheWindowStackAndTerminateTakesItDown)
     EXPECT_NE(ad.color_table, nullptr);
     EXPECT_NE(ad.font_table, nullptr);
     EXPECT_NE(ad.exit, nullptr); // the controller started
-    // The naviframe carries the view's back and more callbacks.
+    // The naviframe carries the view's more callback.
     EXPECT_EQ(
         eext_object_event_callback_del(ad.navi, EEXT_CALLBACK_MORE, zv_upload_view_morekey_cb),
         &ad);
-    eext_object_event_callback_add(ad.navi, EEXT_CALLBACK_MORE, zv_upload_view_morekey_cb, &ad);
 
     // Two launch requests leave one pair of key handlers: a key event reaches the view once,
     // and with the current pair gone it reaches the view no more. The window, iconified
@@ -208,7 +164,8 @@ TEST(UploadMainApp, CreateBuildsTheWindowStackAndTerminateTakesItDown)
     free(ad.category);
 }
 
-TEST(UploadMainApp, MissingTablesAreLoggedAndCreateGoesOn)
+// Missing colour and font tables are logged and create goes on; callbacks refuse what is null.
+TEST(UploadMainApp, MissingTablesAndNullArguments)
 {
     TempDir tmp;
     std::string saved = getenv("ZV_RES_DIR") ? getenv("ZV_RES_DIR") : "";
@@ -221,14 +178,11 @@ TEST(UploadMainApp, MissingTablesAreLoggedAndCreateGoesOn)
     EXPECT_TRUE(process_log.logged("[ERR] font table create fail"));
     EXPECT_EQ(ad.color_table, nullptr);
     _app_terminate(&ad);
-}
 
-TEST(UploadMainApp, NullArgumentsAreRefused)
-{
+    ad = AppData{};
     process_log.mark();
     EXPECT_FALSE(_app_create(nullptr));
     EXPECT_TRUE(process_log.logged("userp is NULL"));
-    AppData ad{};
     _app_control(nullptr, &ad);
     EXPECT_TRUE(process_log.logged("service handle is NULL"));
     app_control_h h = make_request({});
