@@ -13,6 +13,7 @@
 #include <stdlib.h>
 #include <uxt.h>
 
+#include <functional>
 #include <string>
 #include <vector>
 
@@ -31,13 +32,6 @@ zv_test::LogFile g_log; // before anything logs
 AppData g_ad;           // stored once as the process context
 Calls g_calls;
 bool g_transition_done = false; // the naviframe finished a push or pop
-
-// A 4 x 3 picture for a job's thumbnail.
-const char kThumbPng[] =
-    "\x89\x50\x4e\x47\x0d\x0a\x1a\x0a\x00\x00\x00\x0d\x49\x48\x44\x52\x00\x00\x00\x04\x00"
-    "\x00\x00\x03\x08\x02\x00\x00\x00\x3b\x96\x39\x91\x00\x00\x00\x10\x49\x44\x41\x54\x78"
-    "\x9c\x63\x38\x11\xa0\x01\x47\x0c\x38\x39\x00\x2c\x36\x0f\x01\xa2\xa8\x47\x5d\x00\x00"
-    "\x00\x00\x49\x45\x4e\x44\xae\x42\x60\x82";
 
 const std::string kCancel = "core_button_cancel.png";
 const std::string kUpload = "zuvo_icon_badge_upload.png";
@@ -113,39 +107,35 @@ void feed_key(const char *keyname)
         ecore_main_loop_iterate();
 }
 
-// The shown popup among the canvas' top-level objects.
-Evas_Object *find_popup()
+// The first object on the window's canvas (at or below obj when given) that matches.
+Evas_Object *find(const std::function<bool(Evas_Object *)> &match, Evas_Object *obj = nullptr)
 {
-    for (Evas_Object *o = evas_object_bottom_get(evas_object_evas_get(g_ad.win)); o;
-         o = evas_object_above_get(o)) {
-        if (elm_object_widget_check(o) && str(elm_object_widget_type_get(o)) == "Elm_Popup" &&
-            evas_object_visible_get(o))
-            return o;
-    }
-    return nullptr;
-}
-
-// The evas text object at or below obj (the window's canvas when null) that shows text.
-Evas_Object *find_text(const std::string &text, Evas_Object *obj = nullptr)
-{
-    if (!obj) {
-        Evas_Object *found = nullptr;
-        for (Evas_Object *o = evas_object_bottom_get(evas_object_evas_get(g_ad.win)); o && !found;
-             o = evas_object_above_get(o))
-            found = find_text(text, o);
-        return found;
-    }
-    if (str(evas_object_type_get(obj)) == "text" && str(evas_object_text_text_get(obj)) == text)
-        return obj;
-    Evas_Object *found = nullptr;
-    if (Eina_Iterator *it = evas_object_smart_iterator_new(obj)) {
+    Evas_Object *found = obj && match(obj) ? obj : nullptr;
+    if (Eina_Iterator *it = obj && !found ? evas_object_smart_iterator_new(obj) : nullptr) {
         void *child;
         EINA_ITERATOR_FOREACH(it, child)
-        if (!found)
-            found = find_text(text, static_cast<Evas_Object *>(child));
+        found = found ? found : find(match, static_cast<Evas_Object *>(child));
         eina_iterator_free(it);
     }
+    for (Evas_Object *o = obj ? nullptr : evas_object_bottom_get(evas_object_evas_get(g_ad.win));
+         o && !found; o = evas_object_above_get(o))
+        found = find(match, o);
     return found;
+}
+
+Evas_Object *find_popup()
+{
+    return find([](Evas_Object *o) {
+        return elm_object_widget_check(o) && str(elm_object_widget_type_get(o)) == "Elm_Popup" &&
+               evas_object_visible_get(o);
+    });
+}
+
+Evas_Object *find_text(const std::string &text)
+{
+    return find([&](Evas_Object *o) {
+        return str(evas_object_type_get(o)) == "text" && str(evas_object_text_text_get(o)) == text;
+    });
 }
 
 // The size a text is drawn at: its font size times the scale its theme file gives it.
@@ -190,19 +180,15 @@ class ViewTest : public ::testing::Test
             ad->navi, "transition,finished",
             [](void *, Evas_Object *, void *) { g_transition_done = true; }, nullptr);
         elm_object_part_content_set(ad->layout, "elm.swallow.content", ad->navi);
-        evas_object_show(ad->layout);
-        evas_object_show(ad->navi);
-        evas_object_show(ad->win);
-        ad->meta_data_upload = [](AppData *, UploadItem *job) { record("meta", job); };
-        ad->data_upload = [](AppData *, UploadItem *job) { record("data", job); };
+        for (Evas_Object *obj : {ad->layout, ad->navi, ad->win})
+            evas_object_show(obj);
         ad->pause_upload = [](AppData *, UploadItem *job) { record("pause", job); };
         ad->resume_upload = [](AppData *, UploadItem *job) { record("resume", job); };
         ad->exit = [](AppData *) { record("exit", nullptr); };
         // As the controller does: the rows go with the job.
         ad->delete_item = [](UploadItem *job, bool from_db) {
             record(from_db ? "delete_db" : "delete", job);
-            if (job->check)
-                evas_object_del(job->check);
+            evas_object_del(job->check);
             if (job->gen_item)
                 elm_object_item_del(job->gen_item);
             if (job->edit_gen_item)
@@ -274,8 +260,7 @@ class ViewTest : public ::testing::Test
     void enter_edit_mode()
     {
         g_transition_done = false;
-        feed_key("F2");
-        ASSERT_NE(ad->pCtxPopup, nullptr);
+        open_menu();
         Elm_Object_Item *remove = elm_ctxpopup_first_item_get(ad->pCtxPopup);
         ASSERT_EQ(str(elm_object_item_text_get(remove)), "Remove");
         elm_ctxpopup_item_selected_set(remove, EINA_TRUE);
@@ -320,8 +305,7 @@ class ViewTest : public ::testing::Test
 // completed for a job that is not shows no file name.
 TEST_F(ViewTest, RowsFollowTheStatus)
 {
-    std::string thumb = tmp.file("thumb.png");
-    ASSERT_TRUE(zv_test::write_file(thumb, std::string(kThumbPng, sizeof kThumbPng - 1)));
+    const std::string thumb = zv_test::source_path("res/edje/images/zv_thumb_placeholder.png");
     const struct {
         int status, percent;
         const char *name, *thumb, *style;
@@ -500,6 +484,17 @@ TEST_F(ViewTest, SelectionCountsInTheTitleAndDoneButton)
     EXPECT_FALSE(a->checked || b->checked || c->checked);
     EXPECT_TRUE(elm_object_disabled_get(done_button()));
     EXPECT_TRUE(g_calls.empty());
+
+    // A job completing meanwhile switches its rows in place in both lists.
+    Evas_Object *genlist = ad->pGenlist;
+    c->status = ZV_UPLOAD_STATUS_COMPLETED;
+    zv_upload_list_complete_item(c);
+    EXPECT_EQ(ad->pGenlist, genlist);
+    EXPECT_EQ(style_of(c->gen_item), kCompleteStyle);
+    EXPECT_EQ(style_of(c->edit_gen_item), kCompleteStyle);
+    EXPECT_EQ(style_of(b->edit_gen_item), kProgressStyle);
+    ASSERT_TRUE(wait_for([&] { return c->check != nullptr; }));
+    EXPECT_TRUE(wait_for([&] { return sub_text(c->edit_gen_item) == "clip.mp4"; }));
 }
 
 TEST_F(ViewTest, CancelAndBackLeaveEditModeWithoutDeleting)
@@ -585,24 +580,6 @@ TEST_F(ViewTest, DoneDeletesAndAsksBeforeStopping)
     ASSERT_NE(ad->pNoContent, nullptr);
     EXPECT_EQ(elm_object_part_content_get(ad->pListLayout, "elm.swallow.content"), ad->pNoContent);
     EXPECT_NE(access(ongoing.c_str(), F_OK), 0);
-}
-
-TEST_F(ViewTest, CompletedJobSwitchesInPlaceInBothLists)
-{
-    UploadItem *a = add_job(1, ZV_UPLOAD_STATUS_UPLOADING, 90);
-    UploadItem *b = add_job(2, ZV_UPLOAD_STATUS_UPLOADING, 20);
-    show_list();
-    Evas_Object *genlist = ad->pGenlist;
-    enter_edit_mode();
-
-    a->status = ZV_UPLOAD_STATUS_COMPLETED;
-    zv_upload_list_complete_item(a);
-    EXPECT_EQ(ad->pGenlist, genlist);
-    EXPECT_EQ(style_of(a->gen_item), kCompleteStyle);
-    EXPECT_EQ(style_of(a->edit_gen_item), kCompleteStyle);
-    EXPECT_EQ(style_of(b->edit_gen_item), kProgressStyle);
-    ASSERT_TRUE(wait_for([&] { return a->check != nullptr; }));
-    EXPECT_TRUE(wait_for([&] { return sub_text(a->edit_gen_item) == "clip.mp4"; }));
 }
 
 // At scale 1 every control is a touch target of at least 48 x 48 px (badge, title buttons,
