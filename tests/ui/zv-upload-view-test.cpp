@@ -305,7 +305,8 @@ class ViewTest : public ::testing::Test
 // completed for a job that is not shows no file name.
 TEST_F(ViewTest, RowsFollowTheStatus)
 {
-    const std::string thumb = zv_test::source_path("res/edje/images/zv_thumb_placeholder.png");
+    // A picture wider than tall, as video frames are.
+    const std::string thumb = zv_test::source_path("res/edje/images/zv_nocontents_uploads.png");
     const struct {
         int status, percent;
         const char *name, *thumb, *style;
