@@ -8,8 +8,8 @@
 
 #include <filesystem>
 #include <set>
-#include <vector>
 #include <string>
+#include <vector>
 
 #include "app_i18n.h"
 #include "vconf.h"
@@ -54,13 +54,13 @@ TEST(UxtTables, ApplicationTablesReachEdjeAndObjects)
     ASSERT_TRUE(edje_color_class_get("AO005", &er, &eg, &eb, &ea, &x, &x, &x, &x, &x, &x, &x, &x));
     EXPECT_EQ(std::vector<int>({er, eg, eb}), std::vector<int>({r, g, b}));
 
-    // An image is tinted with the colour (premultiplied); a layout gets it as its colour class.
+    // An image is tinted with the (opaque) colour; a layout gets it as its colour class.
     Evas_Object *win = elm_win_add(nullptr, "uxt-test", ELM_WIN_BASIC);
     Evas_Object *image = elm_image_add(win);
     ASSERT_EQ(uxt_theme_object_set_color(image, "AO006"), UXT_ERROR_NONE);
     uxt_theme_get_color("AO006", &r, &g, &b, &a);
     evas_object_color_get(image, &er, &eg, &eb, &ea);
-    EXPECT_EQ(std::vector<int>({er, ea}), std::vector<int>({r * a / 255, a}));
+    EXPECT_EQ(std::vector<int>({er, eg, eb, ea}), std::vector<int>({r, g, b, 255}));
     EXPECT_EQ(uxt_theme_object_set_color(image, "ZZ999"), UXT_ERROR_NO_DATA);
     Evas_Object *layout = elm_layout_add(win);
     ASSERT_EQ(uxt_theme_object_set_color(layout, "AO005"), UXT_ERROR_NONE);
