@@ -19,6 +19,7 @@
 #include <vector>
 
 #include "zv-plugin-curl.h"
+#include "zv-test-server.h"
 
 namespace zv_bench
 {
@@ -60,35 +61,8 @@ inline long rss_kib()
     return kib;
 }
 
-// Starts argv as a child whose first line of output is its port.
-inline pid_t spawn_server(const std::vector<std::string> &argv, int *port)
-{
-    int out[2];
-    if (pipe(out) != 0)
-        return -1;
-    pid_t pid = fork();
-    if (pid == 0) {
-        dup2(out[1], STDOUT_FILENO);
-        close(out[0]);
-        close(out[1]);
-        std::vector<char *> args;
-        for (const std::string &a : argv)
-            args.push_back(const_cast<char *>(a.c_str()));
-        args.push_back(nullptr);
-        execv(args[0], args.data());
-        _exit(127);
-    }
-    close(out[1]);
-    std::string line;
-    char c;
-    while (read(out[0], &c, 1) == 1 && c != '\n')
-        line += c;
-    close(out[0]);
-    // The port is the last number on the line.
-    size_t digits = line.find_last_not_of("0123456789");
-    *port = atoi(line.c_str() + (digits == std::string::npos ? 0 : digits + 1));
-    return pid;
-}
+// The child server: its port is the last number on its first line of output.
+using zv_test::spawn_server;
 
 // ---- engine requests ----
 

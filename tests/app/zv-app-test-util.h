@@ -1,5 +1,5 @@
-// Helpers of the application tests: programs started in the background, their exit, and
-// the lines of a log file.
+// Helpers of the notification test: a program started in the background, its exit, and the
+// lines of a log file. New tests use zv_test::Child, whose exit status is never lost.
 #pragma once
 
 #include <signal.h>
@@ -12,22 +12,18 @@
 
 #include "zv-test-util.h"
 
-namespace zv_test {
+namespace zv_test
+{
 
-// Starts argv (argv[0] a path) with the test's environment and standard input closed;
-// the child's pid or -1.
+// Starts argv (argv[0] a path) with standard input closed; the child's pid or -1.
 inline pid_t spawn_program(const std::vector<std::string> &argv)
 {
     pid_t pid = fork();
-    if (pid != 0)
-        return pid;
-    std::vector<char *> args;
-    for (const auto &a : argv)
-        args.push_back(const_cast<char *>(a.c_str()));
-    args.push_back(nullptr);
-    close(STDIN_FILENO);
-    execv(args[0], args.data());
-    _exit(127);
+    if (pid == 0) {
+        close(STDIN_FILENO);
+        exec_argv(argv);
+    }
+    return pid;
 }
 
 // Waits (spinning the main loop) for a child started by spawn_program; its exit status, or
@@ -35,8 +31,7 @@ inline pid_t spawn_program(const std::vector<std::string> &argv)
 inline int wait_program(pid_t pid, int timeout_ms = 20000)
 {
     int status = 0;
-    bool done = wait_for([&] { return waitpid(pid, &status, WNOHANG) == pid; }, timeout_ms);
-    if (!done) {
+    if (!wait_for([&] { return waitpid(pid, &status, WNOHANG) == pid; }, timeout_ms)) {
         kill(pid, SIGKILL);
         waitpid(pid, &status, 0);
         return -1;
@@ -48,8 +43,7 @@ inline std::vector<std::string> read_lines(const std::string &path)
 {
     std::vector<std::string> lines;
     std::istringstream in(read_file(path));
-    std::string line;
-    while (std::getline(in, line))
+    for (std::string line; std::getline(in, line);)
         lines.push_back(line);
     return lines;
 }
@@ -60,11 +54,6 @@ inline bool has_line(const std::string &path, const std::string &wanted)
         if (line == wanted)
             return true;
     return false;
-}
-
-inline bool log_contains(const std::string &path, const std::string &text)
-{
-    return read_file(path).find(text) != std::string::npos;
 }
 
 } // namespace zv_test

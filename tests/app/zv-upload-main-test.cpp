@@ -6,20 +6,13 @@
 #include <Elementary.h>
 #include <app.h>
 #include <efl_extension.h>
-#include <glib.h>
 #include <gtest/gtest.h>
 #include <stdlib.h>
-#include <string.h>
-#include <uxt.h>
 
-#include <memory>
+#include <sstream>
 #include <string>
 
-#include "zv-app-test-util.h"
-#include "zv-ext-db.h"
-#include "zv-log.h"
-#include "zv-upload-ctrl.h"
-#include "zv-upload-main.h"
+#include "zv-test-util.h"
 #include "zv-upload-view.h"
 
 // The entry's own functions are file-local: the test compiles the file in.
@@ -29,53 +22,24 @@
 
 using namespace zv_test;
 
-namespace {
+namespace
+{
 
 // Every log line of this process and of the programs it starts goes to one file.
-struct ProcessLog {
-    ProcessLog()
-    {
-        char tmpl[] = "/tmp/zv-main-test-log-XXXXXX";
-        int fd = mkstemp(tmpl);
-        if (fd >= 0)
-            close(fd);
-        path = tmpl;
-        setenv("ZV_DLOG_FILE", path.c_str(), 1);
-    }
-    ~ProcessLog() { unlink(path.c_str()); }
-    // The lines of process pid written since mark().
-    std::string lines_of(pid_t pid) const
-    {
-        std::string all = read_file(path).substr(mark_);
-        std::string tag = "(" + std::to_string(pid) + "): ";
-        std::string out;
-        size_t pos = 0;
-        while (pos < all.size()) {
-            size_t end = all.find('\n', pos);
-            if (end == std::string::npos)
-                end = all.size();
-            std::string line = all.substr(pos, end - pos);
-            if (line.find(tag) != std::string::npos)
-                out += line + "\n";
-            pos = end + 1;
-        }
-        return out;
-    }
-    bool logged(const std::string &text, pid_t pid = getpid()) const
-    {
-        return lines_of(pid).find(text) != std::string::npos;
-    }
-    void mark() { mark_ = read_file(path).size(); }
+LogFile process_log;
 
-    std::string path;
-    size_t mark_ = 0;
-};
+// Whether process pid logged text since the log's mark.
+bool logged_by(pid_t pid, const std::string &text)
+{
+    std::istringstream lines(process_log.since_mark());
+    const std::string tag = "(" + std::to_string(pid) + "): ";
+    for (std::string line; std::getline(lines, line);)
+        if (line.find(tag) != std::string::npos && line.find(text) != std::string::npos)
+            return true;
+    return false;
+}
 
-ProcessLog process_log;
-
-using Extras = std::vector<std::pair<const char *, const char *>>;
-
-app_control_h make_request(const Extras &extras)
+app_control_h make_request(const std::vector<std::pair<const char *, const char *>> &extras)
 {
     app_control_h h = nullptr;
     app_control_create(&h);
@@ -84,139 +48,70 @@ app_control_h make_request(const Extras &extras)
     return h;
 }
 
-std::string str(const char *s)
+// The batch settings as "token category description tag access_type use_location".
+std::string batch(const AppData &ad)
 {
-    return s ? s : "(null)";
+    std::ostringstream out;
+    for (const char *s : {ad.access_token, ad.category, ad.description, ad.tag})
+        out << (s ? s : "-") << " ";
+    out << ad.access_type << " " << ad.use_location;
+    return out.str();
 }
 
 } // namespace
 
+// All or nothing: a request that lacks a required extra logs why and keeps the batch.
 TEST(UploadMainExtras, ReadingRules)
 {
-    const Extras full = {{"ZV_DATA_ACCESS_TOKEN", "tok"}, {"ZV_DATA_CATEGORY", "Music"},
-                         {"ZV_DATA_DESCRIPTION", "desc"}, {"ZV_DATA_TAG", "a,b"},
-                         {"ZV_DATA_ACCESS_TYPE", "2"}};
+    const char *tok = "ZV_DATA_ACCESS_TOKEN", *cat = "ZV_DATA_CATEGORY",
+               *type = "ZV_DATA_ACCESS_TYPE";
+    const char *missing = "app_control_get_extra_data error : -126";
     const struct {
-        const char *what;
-        Extras extras;
-        bool ok;
-        const char *message; // logged on failure
-        const char *token, *category, *description, *tag;
-        int access_type;
-        bool use_location;
+        std::vector<std::pair<const char *, const char *>> extras;
+        const char *failure; // logged when the request is refused
+        const char *batch;
     } cases[] = {
-        {"all five", full, true, nullptr, "tok", "Music", "desc", "a,b", 2, false},
-        {"optional ones absent",
-         {{"ZV_DATA_ACCESS_TOKEN", "t2"},
-          {"ZV_DATA_CATEGORY", "People"},
-          {"ZV_DATA_ACCESS_TYPE", "1"}},
-         true,
+        // every extra
+        {{{tok, "tok"},
+          {cat, "Music"},
+          {"ZV_DATA_DESCRIPTION", "d"},
+          {"ZV_DATA_TAG", "a,b"},
+          {type, "2"}},
          nullptr,
-         "t2",
-         "People",
+         "tok Music d a,b 2 0"},
+        // the optional ones absent
+        {{{tok, "t2"}, {cat, "People"}, {type, "1"}}, nullptr, "t2 People - - 1 0"},
+        // an access type that is not a number
+        {{{tok, "t3"}, {cat, "Pets"}, {type, "x"}}, nullptr, "t3 Pets - - 0 0"},
+        // no access type, no token, no category: the batch stays
+        {{{tok, "t4"}, {cat, "Cars"}}, missing, "t3 Pets - - 0 0"},
+        {{{cat, "Cars"}, {type, "1"}}, "app_control_get_extra_data error: -126", "t3 Pets - - 0 0"},
+        {{{tok, "t5"}, {type, "1"}}, missing, "t3 Pets - - 0 0"},
+        // the location on, and "0" is off
+        {{{tok, "t6"}, {cat, "Pets"}, {type, "0"}, {"ZV_DATA_USE_LOCATION", "true"}},
          nullptr,
+         "t6 Pets - - 0 1"},
+        {{{tok, "t7"}, {cat, "Pets"}, {type, "0"}, {"ZV_DATA_USE_LOCATION", "0"}},
          nullptr,
-         1,
-         false},
-        {"access type not a number",
-         {{"ZV_DATA_ACCESS_TOKEN", "t3"},
-          {"ZV_DATA_CATEGORY", "Pets"},
-          {"ZV_DATA_ACCESS_TYPE", "x"}},
-         true,
-         nullptr,
-         "t3",
-         "Pets",
-         nullptr,
-         nullptr,
-         0,
-         false},
-        {"access type missing keeps the batch",
-         {{"ZV_DATA_ACCESS_TOKEN", "t4"}, {"ZV_DATA_CATEGORY", "Cars"}},
-         false,
-         "app_control_get_extra_data error : -126",
-         "t3",
-         "Pets",
-         nullptr,
-         nullptr,
-         0,
-         false},
-        {"token missing keeps the batch",
-         {{"ZV_DATA_CATEGORY", "Cars"}, {"ZV_DATA_ACCESS_TYPE", "1"}},
-         false,
-         "app_control_get_extra_data error: -126",
-         "t3",
-         "Pets",
-         nullptr,
-         nullptr,
-         0,
-         false},
-        {"category missing keeps the batch",
-         {{"ZV_DATA_ACCESS_TOKEN", "t5"}, {"ZV_DATA_ACCESS_TYPE", "1"}},
-         false,
-         "app_control_get_extra_data error : -126",
-         "t3",
-         "Pets",
-         nullptr,
-         nullptr,
-         0,
-         false},
-        {"location on",
-         {{"ZV_DATA_ACCESS_TOKEN", "t6"},
-          {"ZV_DATA_CATEGORY", "Pets"},
-          {"ZV_DATA_ACCESS_TYPE", "0"},
-          {"ZV_DATA_USE_LOCATION", "true"}},
-         true,
-         nullptr,
-         "t6",
-         "Pets",
-         nullptr,
-         nullptr,
-         0,
-         true},
-        {"location 0 is off",
-         {{"ZV_DATA_ACCESS_TOKEN", "t7"},
-          {"ZV_DATA_CATEGORY", "Pets"},
-          {"ZV_DATA_ACCESS_TYPE", "0"},
-          {"ZV_DATA_USE_LOCATION", "0"}},
-         true,
-         nullptr,
-         "t7",
-         "Pets",
-         nullptr,
-         nullptr,
-         0,
-         false},
+         "t7 Pets - - 0 0"},
     };
     AppData ad{};
     for (const auto &c : cases) {
         app_control_h h = make_request(c.extras);
         process_log.mark();
-        EXPECT_EQ(_zv_upload_main_get_app_control_info(h, &ad), c.ok) << c.what;
+        EXPECT_EQ(_zv_upload_main_get_app_control_info(h, &ad), !c.failure) << c.batch;
         app_control_destroy(h);
-        if (c.message) {
-            EXPECT_TRUE(process_log.logged(c.message)) << c.what << "\n"
-                                                       << process_log.lines_of(getpid());
-        }
-        EXPECT_EQ(str(ad.access_token), str(c.token)) << c.what;
-        EXPECT_EQ(str(ad.category), str(c.category)) << c.what;
-        EXPECT_EQ(str(ad.description), str(c.description)) << c.what;
-        EXPECT_EQ(str(ad.tag), str(c.tag)) << c.what;
-        EXPECT_EQ(ad.access_type, c.access_type) << c.what;
-        EXPECT_EQ(ad.use_location, c.use_location) << c.what;
+        EXPECT_TRUE(!c.failure || logged_by(getpid(), c.failure)) << process_log.since_mark();
+        EXPECT_EQ(batch(ad), c.batch);
     }
     free(ad.access_token);
     free(ad.category);
 }
 
-class UploadMainAppTest : public ::testing::Test {
-protected:
-    TempDir tmp_;
-};
-
-TEST_F(UploadMainAppTest, CreateBuildsTheWindowStackAndTerminateTakesItDown)
+TEST(UploadMainApp, CreateBuildsTheWindowStackAndTerminateTakesItDown)
 {
+    TempDir tmp;
     AppData ad{};
-    process_log.mark();
     ASSERT_TRUE(_app_create(&ad));
     ASSERT_NE(ad.win, nullptr);
     EXPECT_STREQ(elm_win_title_get(ad.win), "zuvo-upload-svc");
@@ -227,20 +122,19 @@ TEST_F(UploadMainAppTest, CreateBuildsTheWindowStackAndTerminateTakesItDown)
     EXPECT_NE(ad.color_table, nullptr);
     EXPECT_NE(ad.font_table, nullptr);
     EXPECT_NE(ad.exit, nullptr); // the controller started
-    // The naviframe carries the view's back and more callbacks.
+    // The naviframe carries the view's more callback.
     EXPECT_EQ(
         eext_object_event_callback_del(ad.navi, EEXT_CALLBACK_MORE, zv_upload_view_morekey_cb),
         &ad);
-    eext_object_event_callback_add(ad.navi, EEXT_CALLBACK_MORE, zv_upload_view_morekey_cb, &ad);
 
     // Two launch requests leave one pair of key handlers: a key event reaches the view once,
-    // and with the current pair gone it reaches the view no more.
-    // The window, iconified meanwhile, comes back with a launch request.
-    const Extras extras = {{"ZV_DATA_ACCESS_TOKEN", "t"}, {"ZV_DATA_CATEGORY", "Music"},
-                           {"ZV_DATA_ACCESS_TYPE", "1"}};
+    // and with the current pair gone it reaches the view no more. The window, iconified
+    // meanwhile, comes back with a launch request.
     elm_win_iconified_set(ad.win, EINA_TRUE);
     for (int i = 0; i < 2; i++) {
-        app_control_h h = make_request(extras);
+        app_control_h h = make_request({{"ZV_DATA_ACCESS_TOKEN", "t"},
+                                        {"ZV_DATA_CATEGORY", "Music"},
+                                        {"ZV_DATA_ACCESS_TYPE", "1"}});
         _app_control(h, &ad);
         app_control_destroy(h);
     }
@@ -251,15 +145,15 @@ TEST_F(UploadMainAppTest, CreateBuildsTheWindowStackAndTerminateTakesItDown)
         ev->keyname = ev->key = "Return";
         ev->string = "";
         process_log.mark();
-        ecore_event_add(ECORE_EVENT_KEY_DOWN, ev, [](void *, void *e) { free(e); }, nullptr);
-        wait_for([] { return process_log.logged("zv_upload_view_event_key_down_cb"); }, 2000);
+        ecore_event_add(
+            ECORE_EVENT_KEY_DOWN, ev, [](void *, void *e) { free(e); }, nullptr);
+        return wait_for([] { return process_log.logged("zv_upload_view_event_key_down_cb"); },
+                        2000);
     };
-    press();
-    EXPECT_TRUE(process_log.logged("zv_upload_view_event_key_down_cb"));
+    EXPECT_TRUE(press());
     ecore_event_handler_del(ad.key_down_handler);
     ad.key_down_handler = nullptr;
-    press();
-    EXPECT_FALSE(process_log.logged("zv_upload_view_event_key_down_cb"));
+    EXPECT_FALSE(press());
 
     _app_terminate(&ad);
     EXPECT_EQ(ad.win, nullptr);
@@ -270,30 +164,25 @@ TEST_F(UploadMainAppTest, CreateBuildsTheWindowStackAndTerminateTakesItDown)
     free(ad.category);
 }
 
-TEST_F(UploadMainAppTest, MissingTablesAreLoggedAndCreateGoesOn)
+// Missing colour and font tables are logged and create goes on; callbacks refuse what is null.
+TEST(UploadMainApp, MissingTablesAndNullArguments)
 {
-    const char *env = getenv("ZV_RES_DIR");
-    std::string saved = env ? env : "";
-    setenv("ZV_RES_DIR", tmp_.path().c_str(), 1);
+    TempDir tmp;
+    std::string saved = getenv("ZV_RES_DIR") ? getenv("ZV_RES_DIR") : "";
+    setenv("ZV_RES_DIR", tmp.path().c_str(), 1);
     AppData ad{};
     process_log.mark();
     EXPECT_TRUE(_app_create(&ad));
-    if (env)
-        setenv("ZV_RES_DIR", saved.c_str(), 1);
-    else
-        unsetenv("ZV_RES_DIR");
+    saved.empty() ? unsetenv("ZV_RES_DIR") : setenv("ZV_RES_DIR", saved.c_str(), 1);
     EXPECT_TRUE(process_log.logged("[ERR] color table create fail"));
     EXPECT_TRUE(process_log.logged("[ERR] font table create fail"));
     EXPECT_EQ(ad.color_table, nullptr);
     _app_terminate(&ad);
-}
 
-TEST(UploadMainCallbacks, NullArgumentsAreRefused)
-{
+    ad = AppData{};
     process_log.mark();
     EXPECT_FALSE(_app_create(nullptr));
     EXPECT_TRUE(process_log.logged("userp is NULL"));
-    AppData ad{};
     _app_control(nullptr, &ad);
     EXPECT_TRUE(process_log.logged("service handle is NULL"));
     app_control_h h = make_request({});
@@ -313,23 +202,24 @@ TEST(UploadMainProgram, RunsAsInstanceTakesLaterLaunchesAndEndsOnSigterm)
     TempDir tmp;
     const std::string svc = bin_path("zuvo-upload-svc");
     process_log.mark();
-    pid_t pid = spawn_program({svc, "--extra", "ZV_DATA_ACCESS_TOKEN=t", "--extra",
-                               "ZV_DATA_CATEGORY=Music", "--extra", "ZV_DATA_ACCESS_TYPE=0"});
-    ASSERT_GT(pid, 0);
-    ASSERT_TRUE(wait_for([&] { return process_log.logged("_app_resume", pid); }, 30000))
-        << process_log.lines_of(pid);
+    Child instance;
+    ASSERT_TRUE(instance.start({svc, "--extra", "ZV_DATA_ACCESS_TOKEN=t", "--extra",
+                                "ZV_DATA_CATEGORY=Music", "--extra", "ZV_DATA_ACCESS_TYPE=0"}));
+    const pid_t pid = instance.pid();
+    ASSERT_TRUE(wait_for([&] { return logged_by(pid, "_app_resume"); }, 30000))
+        << process_log.since_mark();
 
     // A later launch without the access type is handed over; the instance keeps running.
-    std::string out;
     EXPECT_EQ(run_program(
                   {svc, "--extra", "ZV_DATA_ACCESS_TOKEN=t2", "--extra", "ZV_DATA_CATEGORY=Pets"}),
               0);
-    EXPECT_TRUE(wait_for([&] { return process_log.logged("get bundle value fail", pid); }, 10000));
-    EXPECT_TRUE(process_log.logged("app_control_get_extra_data error : -126", pid));
+    EXPECT_TRUE(wait_for([&] { return logged_by(pid, "get bundle value fail"); }, 10000));
+    EXPECT_TRUE(logged_by(pid, "app_control_get_extra_data error : -126"));
     EXPECT_EQ(run_program({svc, "--extra", "broken"}), 2);
 
-    kill(pid, SIGTERM);
-    EXPECT_EQ(wait_program(pid), 0);
-    EXPECT_TRUE(process_log.logged("_app_terminate", pid));
-    EXPECT_TRUE(process_log.logged("ui_app_main() loop", pid));
+    instance.signal(SIGTERM);
+    ASSERT_TRUE(instance.wait_exit(20000));
+    EXPECT_EQ(instance.exit_status(), 0);
+    EXPECT_TRUE(logged_by(pid, "_app_terminate"));
+    EXPECT_TRUE(logged_by(pid, "ui_app_main() loop"));
 }

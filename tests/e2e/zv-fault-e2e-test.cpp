@@ -1,8 +1,7 @@
 // Faults injected end to end: the development server cuts, refuses, stalls and floods its
 // answers; another process holds the history locked; the history file and a video go away
 // under the running service. Each fault must leave the job paused (or going on), and the
-// upload again must complete with the server's copy byte-identical: nothing lost. The count
-// of faults injected and survived goes to $ZV_REPORT_DIR/faults.txt.
+// upload again must complete with the server's copy byte-identical: nothing lost.
 #include <gtest/gtest.h>
 #include <sqlite3.h>
 #include <sys/wait.h>
@@ -13,28 +12,17 @@
 #include <string>
 #include <vector>
 
-#include "zv-e2e-ctrl-fixture.h"
+#include "zv-e2e-util.h"
 
 namespace
 {
 
 using zv_e2e::g_log;
 using zv_e2e::kLongWaitMs;
-using zv_e2e::LoggedRequest;
+using zv_e2e::Logged;
 using zv_e2e::Upload;
 using zv_upload_test::run_until;
 using zv_upload_test::stored_rows;
-
-// One report line per fault scenario, also appended to $ZV_REPORT_DIR/faults.txt (the test
-// command adds them up).
-void report(const std::string &kind, int injected, bool survived)
-{
-    std::string line = kind + ": " + std::to_string(injected) + " injected, " +
-                       std::to_string(survived ? injected : 0) + " survived";
-    printf("%s\n", line.c_str());
-    if (const char *dir = getenv("ZV_REPORT_DIR"))
-        std::ofstream(std::string(dir) + "/faults.txt", std::ios::app) << line << "\n";
-}
 
 class FaultE2ETest : public zv_e2e::ControllerFixture
 {
@@ -53,15 +41,14 @@ class FaultE2ETest : public zv_e2e::ControllerFixture
     bool paused(int id) { return rows_are({id}, ZV_UPLOAD_STATUS_PAUSED); }
     // Upload again until the job completes; then the server's copy is checked and no data
     // upload may have sent a byte the server held.
-    void finish(int id, const char *kind, int faults = 1)
+    void finish(int id, const char *kind)
     {
         ASSERT_TRUE(server_.clear_faults());
         ad_.resume_upload(&ad_, job(id));
         ASSERT_TRUE(rows_are({id}, ZV_UPLOAD_STATUS_COMPLETED)) << kind;
         expect_identical(id, file_);
-        for (const LoggedRequest &r : server_.requests())
+        for (const Logged &r : server_.requests())
             EXPECT_NE(r.status, 416) << kind << ": a data upload sent bytes the server held";
-        report(kind, faults, !HasFailure());
     }
 
     // The status query of the upload again is refused: the job stays paused; the next upload
@@ -109,7 +96,7 @@ TEST_F(FaultE2ETest, DataUploadCutAtTwentyOffsets)
         ASSERT_TRUE(run_until([&] { return server_.fired("cut") == cut + 2; }, kLongWaitMs));
     }
     EXPECT_GE(server_.fired("cut"), 20);
-    finish(id, ("20 cuts of the data upload, seed " + std::to_string(seed)).c_str(), 20);
+    finish(id, ("20 cuts of the data upload, seed " + std::to_string(seed)).c_str());
 }
 
 TEST_F(FaultE2ETest, StatusQueryRefusedWith500)
@@ -153,7 +140,7 @@ TEST_F(FaultE2ETest, HistoryLockedLongerThanTheBusyHandlerWaits)
     ASSERT_TRUE(run_until([&] { return stored_rows()[id].percent > 0; }, kLongWaitMs));
     g_log.mark();
     // Another process holds the write lock for 5 s; the busy handler gives up after 1.5 s.
-    zv_e2e::Child holder;
+    zv_test::Child holder;
     std::string said = dir_.file("holder.out");
     ASSERT_TRUE(holder.start({"/proc/self/exe"}, said, {{"ZV_TEST_HOLD_HISTORY_LOCK_MS", "5000"}}));
     ASSERT_TRUE(run_until([&] { return zv_test::read_file(said) == "locked\n"; }, kLongWaitMs));
@@ -179,7 +166,6 @@ TEST_F(FaultE2ETest, HistoryReplacedByAFileThatIsNotADatabase)
     ASSERT_TRUE(run_until([&] { return job(id)->status == ZV_UPLOAD_STATUS_COMPLETED; },
                           kLongWaitMs));
     expect_identical(id, file_);
-    report("history replaced by a non-database file", 1, !HasFailure());
 }
 
 TEST_F(FaultE2ETest, VideoDisappearsMidUpload)
@@ -206,7 +192,6 @@ TEST_F(FaultE2ETest, VideoDisappearsMidUpload)
     ad_.resume_upload(&ad_, job(ids[1]));
     ASSERT_TRUE(rows_are({ids[1]}, ZV_UPLOAD_STATUS_COMPLETED));
     expect_identical(ids[1], file_);
-    report("video removed mid-upload", 1, !HasFailure());
 }
 
 } // namespace

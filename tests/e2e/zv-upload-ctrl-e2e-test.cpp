@@ -13,8 +13,6 @@
 #include <string>
 #include <vector>
 
-#include "../upload-svc/zv-upload-test-util.h"
-#include "zv-e2e-ctrl-fixture.h"
 #include "zv-e2e-util.h"
 #include "zv-ext-network.h"
 #include "zv-upload-ctrl.h"
@@ -23,8 +21,7 @@
 namespace
 {
 
-using zv_e2e::DevServer;
-using zv_e2e::LoggedRequest;
+using zv_e2e::Logged;
 using zv_e2e::Upload;
 using zv_upload_test::run_until;
 using zv_upload_test::stored_rows;
@@ -54,7 +51,7 @@ TEST_F(CtrlE2ETest, NetworkEventPausesRunningUploadsAndUploadAgainContinues)
     launch();
     ASSERT_TRUE(run_until([&] { return server_.fired("stall") == 1; }, kLongWaitMs));
 
-    ASSERT_TRUE(zv_e2e::set_int_key("memory/dnet/status", 2));
+    ASSERT_TRUE(zv_e2e::set_key("int", "memory/dnet/status", "2"));
     ASSERT_TRUE(rows_are(ids, ZV_UPLOAD_STATUS_PAUSED));
     EXPECT_EQ(job(ids[0])->status, ZV_UPLOAD_STATUS_PAUSED);
     EXPECT_EQ(job(ids[1])->status, ZV_UPLOAD_STATUS_PAUSED);
@@ -180,7 +177,6 @@ TEST_F(CtrlE2ETest, StressOfThirtyJobsWithEventsAtRandomMoments)
     start_controller();
     launch();
 
-    std::map<std::string, int> events;
     std::set<int> deleted;
     auto jobs_in = [&](int status) {
         std::vector<UploadItem *> found;
@@ -249,7 +245,6 @@ TEST_F(CtrlE2ETest, StressOfThirtyJobsWithEventsAtRandomMoments)
             },
             5000);
         _zv_upload_ctrl_net_status_cb(1, &ad_);
-        events["network event at metadata answers"]++;
     };
 
     std::uniform_int_distribution<int> pause_ms(20, 150), kind(0, 11);
@@ -258,29 +253,23 @@ TEST_F(CtrlE2ETest, StressOfThirtyJobsWithEventsAtRandomMoments)
         run_until([] { return false; }, pause_ms(rng));
         int k = kind(rng);
         if (k <= 1) {
-            ASSERT_TRUE(zv_e2e::set_int_key("memory/dnet/status", 2));
-            events["network event"]++;
+            ASSERT_TRUE(zv_e2e::set_key("int", "memory/dnet/status", "2"));
         } else if (k == 10 && !jobs_in(ZV_UPLOAD_STATUS_PAUSED).empty()) {
             // A tap on the badge while the status query of upload again is out.
             UploadItem *job = pick(jobs_in(ZV_UPLOAD_STATUS_PAUSED));
             ad_.resume_upload(&ad_, job);
             ad_.pause_upload(&ad_, job);
-            events["pause during a status query"]++;
         } else if (k == 11) {
             launch();
-            events["launch request"]++;
         } else if (k <= 4 && !jobs_in(ZV_UPLOAD_STATUS_UPLOADING).empty()) {
             ad_.pause_upload(&ad_, pick(jobs_in(ZV_UPLOAD_STATUS_UPLOADING)));
-            events["badge pause"]++;
         } else if (k <= 7 && !jobs_in(ZV_UPLOAD_STATUS_PAUSED).empty()) {
             ad_.resume_upload(&ad_, pick(jobs_in(ZV_UPLOAD_STATUS_PAUSED)));
-            events["badge resume"]++;
         } else if (k == 8 && deleted.size() < 4 && g_list_length(ad_.job_list) > 1) {
             std::vector<UploadItem *> all;
             for (GList *l = ad_.job_list; l; l = l->next)
                 all.push_back(static_cast<UploadItem *>(l->data));
             ASSERT_EQ(delete_in_edit_mode(pick(all)), "");
-            events["deletion in edit mode"]++;
         } else if (k == 9 && !second_launch) {
             std::vector<int> more = zv_e2e::record(
                 std::vector<std::string>(files.begin() + 20, files.end()), "Stress");
@@ -288,7 +277,6 @@ TEST_F(CtrlE2ETest, StressOfThirtyJobsWithEventsAtRandomMoments)
             ids.insert(ids.end(), more.begin(), more.end());
             launch();
             second_launch = true;
-            events["second launch request"]++;
             network_event_at_metadata_answers(more);
         }
     }
@@ -297,7 +285,6 @@ TEST_F(CtrlE2ETest, StressOfThirtyJobsWithEventsAtRandomMoments)
             zv_e2e::record(std::vector<std::string>(files.begin() + 20, files.end()), "Stress");
         ids.insert(ids.end(), more.begin(), more.end());
         launch();
-        events["second launch request"]++;
     }
 
     // The rest at full speed: paused jobs are resumed until every remaining one completes.
@@ -321,41 +308,22 @@ TEST_F(CtrlE2ETest, StressOfThirtyJobsWithEventsAtRandomMoments)
     auto rows = stored_rows();
     for (int id : deleted)
         EXPECT_EQ(rows.count(id), 0u) << "row " << id << " was deleted in edit mode";
-    int identical = 0;
     for (size_t i = 0; i < ids.size(); ++i) {
         if (deleted.count(ids[i]))
             continue;
         Upload u = upload_of(ids[i]);
-        bool same = u.complete && zv_test::read_file(u.path) == contents_[files[i]];
-        EXPECT_TRUE(same) << "server copy of " << files[i];
-        identical += same;
+        EXPECT_TRUE(u.complete && zv_test::read_file(u.path) == contents_[files[i]]) << "server copy of " << files[i];
     }
-    // The server refuses (416) a data upload that starts elsewhere than its byte count: that
-    // means two requests of one job crossed, or a data upload went out from an old offset.
-    int refused = 0;
-    for (const LoggedRequest &r : server_.requests()) {
+    // The server refuses (416) a data upload that starts elsewhere than its byte count: two
+    // requests of one job crossed, or a data upload went out from an old offset.
+    for (const Logged &r : server_.requests()) {
         if (r.status != 416)
             continue;
-        refused++;
         std::string history;
-        for (const LoggedRequest &q : server_.requests_of(r.upload_id))
-            history += "  #" + std::to_string(q.seq) + " " + q.kind + " " + q.content_range +
-                       " -> " + std::to_string(q.status) + " (" + q.outcome + ", " +
-                       std::to_string(q.body_length) + " bytes)\n";
-        ADD_FAILURE() << "a data upload was refused for its range; the upload's requests:\n"
-                      << history;
+        for (const Logged &q : server_.requests_of(r.upload_id))
+            history += q.line + "\n";
+        ADD_FAILURE() << "a data upload was refused for its range; the upload's requests:\n" << history;
     }
-
-    std::string summary = "stress: seed " + std::to_string(seed) + ", 30 jobs";
-    for (const auto &e : events)
-        summary += ", " + std::to_string(e.second) + " " + e.first;
-    summary += "; " + std::to_string(refused) + " data uploads refused for their range";
-    summary += "; " + std::to_string(identical) + " of " + std::to_string(kept.size()) +
-               " kept jobs completed byte-identical, " + std::to_string(deleted.size()) +
-               " deleted with their rows; " + (HasFailure() ? "FAILED" : "nothing lost");
-    printf("%s\n", summary.c_str());
-    if (const char *dir = getenv("ZV_REPORT_DIR"))
-        std::ofstream(std::string(dir) + "/stress.txt", std::ios::app) << summary << "\n";
 }
 
 } // namespace

@@ -2,7 +2,6 @@
 // rows the companion client records to the development server, is killed or terminated in
 // the middle, is launched again, and meets the failures of the server and of its settings.
 #include <fcntl.h>
-#include <gtest/gtest.h>
 #include <signal.h>
 #include <sys/stat.h>
 #include <sys/statvfs.h>
@@ -10,41 +9,33 @@
 
 #include <filesystem>
 #include <fstream>
-#include <map>
 #include <memory>
-#include <random>
-#include <string>
-#include <vector>
 
-#include "../upload-svc/zv-upload-test-util.h"
 #include "zv-e2e-util.h"
-#include "zv-ext-db.h"
 
 namespace
 {
 
-using zv_e2e::Child;
-using zv_e2e::DevServer;
-using zv_e2e::LoggedRequest;
-using zv_e2e::Upload;
+using namespace zv_e2e;
+using zv_test::Child;
+using zv_test::wait_for;
 using zv_upload_test::notification;
-using zv_upload_test::stored_rows;
 
-constexpr int kLongWaitMs = 60000;
+const zv_test::Env kBatch = {{"ZV_DATA_ACCESS_TOKEN", "dev-token"}, {"ZV_DATA_CATEGORY", "People"}, {"ZV_DATA_ACCESS_TYPE", "0"}};
 
-const zv_e2e::Env kBatch = {{"ZV_DATA_ACCESS_TOKEN", "dev-token"},
-                            {"ZV_DATA_CATEGORY", "People"},
-                            {"ZV_DATA_ACCESS_TYPE", "0"}};
+// The first sanitizer report in a program's output, or "" when there is none.
+std::string sanitizer_report(const std::string &output)
+{
+    for (const char *marker : {"ERROR: AddressSanitizer", "ERROR: LeakSanitizer", "WARNING: ThreadSanitizer", "runtime error:"})
+        if (output.find(marker) != std::string::npos)
+            return output.substr(output.find(marker), 4000);
+    return "";
+}
 
-class ServiceE2ETest : public ::testing::Test
+// The service in processes of its own, headless.
+class ServiceE2ETest : public E2ETest
 {
   protected:
-    void SetUp() override
-    {
-        ASSERT_TRUE(zv_e2e::set_network(true));
-        ASSERT_TRUE(zv_e2e::set_api_key("dev-key"));
-        ASSERT_TRUE(zv_ext_db_open());
-    }
     void TearDown() override
     {
         // Every service process ends well, and says nothing a sanitizer found.
@@ -53,69 +44,28 @@ class ServiceE2ETest : public ::testing::Test
             EXPECT_TRUE(svc->wait_exit(kLongWaitMs)) << "the service did not end";
             EXPECT_TRUE(svc->ended_well()) << "exit status " << svc->raw_status();
         }
-        EXPECT_EQ(zv_e2e::sanitizer_report(zv_test::read_file(dir_.file("svc.out"))), "");
-        zv_ext_db_close();
-    }
-
-    bool start_server(const std::vector<std::string> &faults = {})
-    {
-        std::vector<std::string> args;
-        for (const auto &f : faults) {
-            args.push_back("--fault");
-            args.push_back(f);
-        }
-        return server_.start(dir_.path(), args);
+        EXPECT_EQ(sanitizer_report(zv_test::read_file(dir_.file("svc.out"))), "");
+        E2ETest::TearDown();
     }
     // Starts a service process with these launch extras (and this open-file limit when above
     // 0); its log goes to svc.log.
-    Child &start_service(const zv_e2e::Env &extras = kBatch, rlim_t nofile = 0)
+    Child &start_service(const zv_test::Env &extras = kBatch, rlim_t nofile = 0)
     {
         services_.push_back(std::make_unique<Child>());
-        Child &svc = *services_.back();
-        std::vector<std::string> argv = {zv_test::bin_path("zuvo-upload-svc")};
-        for (const auto &kv : extras) {
-            argv.push_back("--extra");
-            argv.push_back(kv.first + "=" + kv.second);
-        }
-        zv_e2e::Env env = server_.env();
-        env.push_back({"ZV_DLOG_FILE", log_path()});
-        EXPECT_TRUE(svc.start(argv, dir_.file("svc.out"), env, nofile));
-        return svc;
+        std::vector<std::string> argv = {bin_path("zuvo-upload-svc")};
+        for (const auto &kv : extras)
+            argv.insert(argv.end(), {"--extra", kv.first + "=" + kv.second});
+        EXPECT_TRUE(services_.back()->start(argv, dir_.file("svc.out"), {{"ZV_DLOG_FILE", log_path()}}, nofile));
+        return *services_.back();
     }
     std::string log_path() const { return dir_.file("svc.log"); }
-    bool logged(const std::string &text) const
-    {
-        return zv_test::read_file(log_path()).find(text) != std::string::npos;
-    }
-    std::string video(const std::string &name, size_t bytes, unsigned seed)
-    {
-        std::string path = dir_.file(name);
-        contents_[path] = zv_e2e::make_video(path, bytes, seed);
-        return path;
-    }
+    bool logged(const std::string &text) const { return zv_test::read_file(log_path()).find(text) != std::string::npos; }
     bool wait_status(int historyid, int status, int timeout_ms = kLongWaitMs)
     {
-        return zv_test::wait_for([&] { return stored_rows()[historyid].status == status; },
-                                 timeout_ms);
-    }
-    // The server's upload of the row, once the row has its upload address.
-    Upload upload_of(int historyid) { return server_.upload_of_url(stored_rows()[historyid].url); }
-    bool mid_upload(int historyid)
-    {
-        Upload u = upload_of(historyid);
-        return u.held > 0 && !u.complete;
-    }
-    void expect_identical(int historyid, const std::string &file)
-    {
-        Upload u = upload_of(historyid);
-        ASSERT_TRUE(u.complete) << "upload of " << historyid;
-        EXPECT_TRUE(zv_test::read_file(u.path) == contents_[file]) << "bytes of " << file;
+        return rows_are({historyid}, status, timeout_ms);
     }
 
-    zv_test::TempDir dir_;
-    DevServer server_;
     std::vector<std::unique_ptr<Child>> services_;
-    std::map<std::string, std::string> contents_;
 };
 
 TEST_F(ServiceE2ETest, TwoRecordedFilesUploadSideBySide)
@@ -123,12 +73,12 @@ TEST_F(ServiceE2ETest, TwoRecordedFilesUploadSideBySide)
     ASSERT_TRUE(start_server({"kind=data,action=throttle,rate=1000000,times=0"}));
     std::string a = video("a.mp4", 2500000, 1);
     std::string b = video("b.mp4", 2000000, 2);
-    std::vector<int> ids = zv_e2e::record({a, b}, "Holiday");
+    std::vector<int> ids = record({a, b}, "Holiday");
     ASSERT_EQ(ids.size(), 2u);
     Child &svc = start_service();
 
     EXPECT_TRUE(
-        zv_test::wait_for([&] { return mid_upload(ids[0]) && mid_upload(ids[1]); }, kLongWaitMs))
+        wait_for([&] { return mid_upload(ids[0]) && mid_upload(ids[1]); }, kLongWaitMs))
         << "both files are on their way at once";
     ASSERT_TRUE(wait_status(ids[0], ZV_UPLOAD_STATUS_COMPLETED));
     ASSERT_TRUE(wait_status(ids[1], ZV_UPLOAD_STATUS_COMPLETED));
@@ -144,7 +94,7 @@ TEST_F(ServiceE2ETest, TwoRecordedFilesUploadSideBySide)
     expect_identical(ids[1], b);
 
     std::string run = dir_.file("run");
-    ASSERT_TRUE(zv_test::wait_for([&] { return notification(run, "zuvo_ongoing_noti").empty(); },
+    ASSERT_TRUE(wait_for([&] { return notification(run, "zuvo_ongoing_noti").empty(); },
                                   kLongWaitMs));
     auto complete = notification(run, "zuvo_complete_noti");
     ASSERT_FALSE(complete.empty());
@@ -173,9 +123,9 @@ TEST_F(ServiceE2ETest, KilledMidUploadResumesWithStatusQueryAtNextStart)
 {
     ASSERT_TRUE(start_server({"kind=data,action=throttle,rate=300000,times=0"}));
     std::string file = video("long.mp4", 3000000, 3);
-    int id = zv_e2e::record({file}, "Long").at(0);
+    int id = record({file}, "Long").at(0);
     Child &first = start_service();
-    ASSERT_TRUE(zv_test::wait_for([&] { return upload_of(id).held > 200000; }, kLongWaitMs));
+    ASSERT_TRUE(wait_for([&] { return upload_of(id).held > 200000; }, kLongWaitMs));
     ASSERT_FALSE(upload_of(id).complete);
     first.signal(SIGKILL);
     ASSERT_TRUE(first.wait_exit(kLongWaitMs));
@@ -188,8 +138,8 @@ TEST_F(ServiceE2ETest, KilledMidUploadResumesWithStatusQueryAtNextStart)
 
     // The restart sent one status query, then one data upload of the bytes the server lacked
     // (the server refuses with 416 a range that does not start at its byte count).
-    std::vector<LoggedRequest> queries, resumed;
-    for (const LoggedRequest &r : server_.requests_of(upload_of(id).id)) {
+    std::vector<Logged> queries, resumed;
+    for (const Logged &r : server_.requests_of(upload_of(id).id)) {
         EXPECT_NE(r.status, 416) << "a data upload sent bytes the server held";
         if (r.kind == "status")
             queries.push_back(r);
@@ -209,14 +159,14 @@ TEST_F(ServiceE2ETest, TerminatedMidUploadWritesRowsBack)
     // still waiting when the service is terminated.
     ASSERT_TRUE(start_server({"kind=data,action=throttle,rate=300000,times=0",
                               "kind=meta,action=stall,seconds=60,nth=2"}));
-    int uploading = zv_e2e::record({video("up.mp4", 3000000, 4)}, "Uploading").at(0);
+    int uploading = record({video("up.mp4", 3000000, 4)}, "Uploading").at(0);
     Child &svc = start_service();
-    ASSERT_TRUE(zv_test::wait_for([&] { return mid_upload(uploading); }, kLongWaitMs));
-    int waiting = zv_e2e::record({video("wait.mp4", 1000000, 5)}, "Waiting").at(0);
+    ASSERT_TRUE(wait_for([&] { return mid_upload(uploading); }, kLongWaitMs));
+    int waiting = record({video("wait.mp4", 1000000, 5)}, "Waiting").at(0);
     Child &launcher = start_service();
     ASSERT_TRUE(launcher.wait_exit(kLongWaitMs));
     ASSERT_TRUE(wait_status(waiting, ZV_UPLOAD_STATUS_WAITING));
-    ASSERT_TRUE(zv_test::wait_for([&] { return server_.fired("stall") == 1; }, kLongWaitMs))
+    ASSERT_TRUE(wait_for([&] { return server_.fired("stall") == 1; }, kLongWaitMs))
         << "the second metadata upload reached the server";
     EXPECT_EQ(stored_rows()[uploading].status, ZV_UPLOAD_STATUS_UPLOADING);
 
@@ -234,12 +184,12 @@ TEST_F(ServiceE2ETest, SecondLaunchAddsNewRowsWhileUploadsRun)
 {
     ASSERT_TRUE(start_server({"kind=data,action=throttle,rate=500000,times=1"}));
     std::string first_file = video("first.mp4", 3000000, 6);
-    int first = zv_e2e::record({first_file}, "First").at(0);
+    int first = record({first_file}, "First").at(0);
     start_service();
-    ASSERT_TRUE(zv_test::wait_for([&] { return mid_upload(first); }, kLongWaitMs));
+    ASSERT_TRUE(wait_for([&] { return mid_upload(first); }, kLongWaitMs));
 
     std::string second_file = video("second.mp4", 500000, 7);
-    int second = zv_e2e::record({second_file}, "Second").at(0);
+    int second = record({second_file}, "Second").at(0);
     Child &launcher = start_service();
     int status = 0;
     ASSERT_TRUE(launcher.wait_exit(kLongWaitMs, &status));
@@ -250,7 +200,7 @@ TEST_F(ServiceE2ETest, SecondLaunchAddsNewRowsWhileUploadsRun)
     expect_identical(first, first_file);
     expect_identical(second, second_file);
     int data_requests = 0;
-    for (const LoggedRequest &r : server_.requests_of(upload_of(first).id))
+    for (const Logged &r : server_.requests_of(upload_of(first).id))
         data_requests += r.kind == "data";
     EXPECT_EQ(data_requests, 1) << "the running upload went on undisturbed";
 }
@@ -308,13 +258,13 @@ TEST_F(LargeFileE2ETest, VideoPastTwoGiBSurvivesAKillAndArrivesWhole)
 
     // The first data upload is read slowly enough to catch the server past 2 GiB.
     ASSERT_TRUE(start_server({"kind=data,action=throttle,rate=134217728"}));
-    int id = zv_e2e::record({file}, "Long").at(0);
+    int id = record({file}, "Long").at(0);
     Child &first = start_service();
     std::string copy;
     ASSERT_TRUE(
-        zv_test::wait_for([&] { return !(copy = upload_of(id).path).empty(); }, kLongWaitMs));
+        wait_for([&] { return !(copy = upload_of(id).path).empty(); }, kLongWaitMs));
     struct stat st = {};
-    ASSERT_TRUE(zv_test::wait_for(
+    ASSERT_TRUE(wait_for(
         [&] { return stat(copy.c_str(), &st) == 0 && st.st_size > kTwoGiB; }, 4 * kLongWaitMs));
     first.signal(SIGKILL);
     ASSERT_TRUE(first.wait_exit(kLongWaitMs));
@@ -331,8 +281,8 @@ TEST_F(LargeFileE2ETest, VideoPastTwoGiBSurvivesAKillAndArrivesWhole)
     EXPECT_EQ(u.total, kSize);
     EXPECT_TRUE(same_bytes(file, u.path)) << "server copy of " << file;
     // The rest went in one data upload behind one status query, from past 2 GiB.
-    std::vector<LoggedRequest> resumed;
-    for (const LoggedRequest &r : server_.requests_of(u.id)) {
+    std::vector<Logged> resumed;
+    for (const Logged &r : server_.requests_of(u.id)) {
         EXPECT_NE(r.status, 416) << "a data upload sent bytes the server held";
         if (r.kind == "data" && r.range_start() > 0)
             resumed.push_back(r);
@@ -364,7 +314,7 @@ TEST_F(ServiceE2ETest, BatchPastTheOpenFileLimitCompletes)
                 return false;
         return true;
     };
-    ASSERT_TRUE(zv_test::wait_for(all_completed, 4 * kLongWaitMs));
+    ASSERT_TRUE(wait_for(all_completed, 4 * kLongWaitMs));
     std::map<std::string, Upload> by_url;
     for (const Upload &u : server_.uploads())
         by_url[u.url] = u;
@@ -375,7 +325,7 @@ TEST_F(ServiceE2ETest, BatchPastTheOpenFileLimitCompletes)
     }
     EXPECT_FALSE(logged("Too many open files"));
     std::string run = dir_.file("run");
-    ASSERT_TRUE(zv_test::wait_for([&] { return notification(run, "zuvo_ongoing_noti").empty(); },
+    ASSERT_TRUE(wait_for([&] { return notification(run, "zuvo_ongoing_noti").empty(); },
                                   kLongWaitMs));
     EXPECT_NE(notification(run, "zuvo_complete_noti")["title"].find("200"), std::string::npos);
 }
@@ -413,23 +363,23 @@ TEST_P(ServiceFailureTest, RowEndsAsExpectedWithItsMessage)
         ASSERT_EQ(unlink(dir_.file("keys/zuvo.tizen.api.key").c_str()), 0);
     }
     if (!c.network) {
-        ASSERT_TRUE(zv_e2e::set_network(false));
+        ASSERT_TRUE(set_network(false));
     }
-    int id = zv_e2e::record({video("clip.mp4", 100000, 8)}, "Clip").at(0);
-    zv_e2e::Env extras = kBatch;
+    int id = record({video("clip.mp4", 100000, 8)}, "Clip").at(0);
+    zv_test::Env extras = kBatch;
     if (!c.access_type)
         extras.pop_back();
     start_service(extras);
 
     if (c.status == ZV_UPLOAD_STATUS_WAITING) {
         // The launch request has run once the ongoing notification is up.
-        ASSERT_TRUE(zv_test::wait_for(
+        ASSERT_TRUE(wait_for(
             [&] { return !notification(dir_.file("run"), "zuvo_ongoing_noti").empty(); },
             kLongWaitMs));
     } else {
         ASSERT_TRUE(wait_status(id, c.status));
     }
-    ASSERT_TRUE(zv_test::wait_for([&] { return logged(c.message); }, kLongWaitMs)) << c.message;
+    ASSERT_TRUE(wait_for([&] { return logged(c.message); }, kLongWaitMs)) << c.message;
     EXPECT_EQ(stored_rows()[id].status, c.status);
     if (c.also) {
         EXPECT_TRUE(logged(c.also)) << c.also;

@@ -24,149 +24,20 @@
 
 #include "zv-plugin-main.h"
 #include "zv-plugin-xml.h"
-#include "zv-test-util.h"
+#include "zv-test-server.h"
 
 namespace {
 
+using zv_test::Headers;
+using zv_test::Logged;
 using zv_test::read_file;
 using zv_test::wait_for;
-using Headers = std::vector<std::pair<std::string, std::string>>;
 
 const char TOKEN[] = "access-token-1";
 const char API_KEY[] = "api-key-1";
 const char ISSUED_TOKEN[] = "issued-token-1";
 const char USER_AGENT[] = "Mozilla/5.0 (Linux; Tizen 2.4; HALVANE QX-M410) AppleWebKit/537.3 "
                           "(KHTML, like Gecko) HalvaneBrowser/1.1 Mobile Safari/537.3";
-
-// --- The server's request log: one JSON object per line ---
-
-// The JSON string whose opening quote is at text[pos]; pos ends past its closing quote.
-std::string json_string(const std::string &text, size_t &pos)
-{
-    std::string out;
-    for (pos++; pos < text.size() && text[pos] != '"'; pos++) {
-        if (text[pos] != '\\') {
-            out += text[pos];
-        } else if (text[++pos] == 'u') {
-            char utf8[8] = {0};
-            g_unichar_to_utf8((gunichar)std::stoul(text.substr(pos + 1, 4), nullptr, 16), utf8);
-            out += utf8;
-            pos += 4;
-        } else {
-            const char *hit = strchr("nrt", text[pos]);
-            out += hit ? "\n\r\t"[hit - "nrt"] : text[pos];
-        }
-    }
-    pos++;
-    return out;
-}
-
-// One request as the server logged it.
-struct Logged {
-    std::string line;
-    Headers headers;
-
-    explicit Logged(const std::string &l) : line(l)
-    {
-        size_t pos = line.find("\"headers\":[") + 11;
-        while (line.compare(pos, 2, "[\"") == 0) {
-            pos++;
-            std::string name = json_string(line, pos);
-            pos++; // ','
-            headers.emplace_back(name, json_string(line, pos));
-            pos += line.compare(pos, 2, "],") == 0 ? 2 : 1;
-        }
-    }
-    // A member's value: a string unquoted, anything else as written.
-    std::string get(const std::string &key) const
-    {
-        size_t pos = line.find("\"" + key + "\":");
-        if (pos == std::string::npos)
-            return "";
-        pos += key.size() + 3;
-        if (line[pos] == '"')
-            return json_string(line, pos);
-        return line.substr(pos, line.find_first_of(",}", pos) - pos);
-    }
-    std::string body() const
-    {
-        gsize len = 0;
-        guchar *bytes = g_base64_decode(get("body_base64").c_str(), &len);
-        std::string out(reinterpret_cast<char *>(bytes), len);
-        g_free(bytes);
-        return out;
-    }
-    std::optional<std::string> header(const std::string &name) const
-    {
-        for (const auto &h : headers)
-            if (h.first == name)
-                return h.second;
-        return std::nullopt;
-    }
-};
-
-// zuvo-devserver for one test, in its own folder; stopped by its pid.
-class DevServer {
-public:
-    DevServer(const std::string &dir, std::vector<std::string> args) : dir_(dir)
-    {
-        mkdir(dir.c_str(), 0700);
-        args.insert(args.begin(), {zv_test::bin_path("zuvo-devserver"), "--storage",
-                                   dir + "/store", "--log", dir + "/requests.jsonl"});
-        const bool tls = std::count(args.begin(), args.end(), "--tls-port") > 0;
-        int out[2];
-        if (pipe(out) != 0)
-            return;
-        pid_ = fork();
-        if (pid_ == 0) {
-            dup2(out[1], 1);
-            std::vector<char *> argv;
-            for (auto &a : args)
-                argv.push_back(&a[0]);
-            argv.push_back(nullptr);
-            execv(argv[0], argv.data());
-            _exit(127);
-        }
-        close(out[1]);
-        std::string text;
-        char buf[256];
-        pollfd pfd = {out[0], POLLIN, 0};
-        ssize_t n = 0;
-        while (std::count(text.begin(), text.end(), '\n') < (tls ? 2 : 1) &&
-               poll(&pfd, 1, 20000) > 0 && (n = read(out[0], buf, sizeof buf)) > 0)
-            text.append(buf, (size_t)n);
-        close(out[0]);
-        sscanf(text.c_str(), "port %d\ntls-port %d", &port_, &tls_port_);
-    }
-    ~DevServer()
-    {
-        if (pid_ > 0) {
-            kill(pid_, SIGTERM);
-            waitpid(pid_, nullptr, 0);
-        }
-    }
-
-    int port() const { return port_; }
-    std::string host() const { return "127.0.0.1:" + std::to_string(port_); }
-    std::string tls_host() const { return "127.0.0.1:" + std::to_string(tls_port_); }
-    std::string stored(const std::string &upload_id) const
-    {
-        return read_file(dir_ + "/store/" + upload_id + ".data");
-    }
-    std::vector<Logged> requests() const
-    {
-        std::vector<Logged> all;
-        std::istringstream lines(read_file(dir_ + "/requests.jsonl"));
-        for (std::string line; std::getline(lines, line);)
-            all.emplace_back(line);
-        return all;
-    }
-
-private:
-    std::string dir_;
-    pid_t pid_ = -1;
-    int port_ = 0, tls_port_ = 0;
-};
 
 // --- What reaches the handles' callbacks (worker thread) ---
 
@@ -261,9 +132,8 @@ protected:
     {
         std::vector<std::string> args = server_args();
         args.insert(args.end(), extra.begin(), extra.end());
-        server_.reset();
-        server_ = std::make_unique<DevServer>(tmp_.file("server" + std::to_string(++starts_)),
-                                              args);
+        server_ = std::make_unique<zv_test::DevServer>();
+        ASSERT_TRUE(server_->start(tmp_.file("server" + std::to_string(++starts_)), args));
         setenv("ZV_UPLOAD_HOST", server_->host().c_str(), 1);
         setenv("ZV_DATA_HOST", server_->host().c_str(), 1);
     }
@@ -326,7 +196,7 @@ protected:
     }
 
     zv_test::TempDir tmp_;
-    std::unique_ptr<DevServer> server_;
+    std::unique_ptr<zv_test::DevServer> server_;
     const std::string clip_ = tmp_.file("clip.mp4");
     Inbox inbox_;
     size_t log_start_ = 0;

@@ -5,13 +5,17 @@
 #include <sys/socket.h>
 
 #include <Ecore.h>
+#include <errno.h>
 #include <fcntl.h>
+#include <signal.h>
 #include <stdlib.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
 #include <chrono>
+#include <filesystem>
 #include <fstream>
+#include <map>
 #include <sstream>
 #include <thread>
 
@@ -19,15 +23,33 @@ namespace zv_test {
 
 namespace {
 
-void remove_tree(const std::string &path)
+// The exit statuses of the children the main loop reaped, by pid.
+std::map<pid_t, int> &reaped_by_loop()
 {
-    std::string cmd = "rm -rf '" + path + "'";
-    if (system(cmd.c_str()) != 0) {
-        // Nothing to do: a folder left behind in /tmp is harmless.
-    }
+    static std::map<pid_t, int> statuses;
+    static Ecore_Event_Handler *handler = ecore_event_handler_add(
+        ECORE_EXE_EVENT_DEL,
+        [](void *, int, void *event) -> Eina_Bool {
+            auto *del = static_cast<Ecore_Exe_Event_Del *>(event);
+            statuses[del->pid] = del->signalled ? (del->exit_signal & 0x7f) : ((del->exit_code & 0xff) << 8);
+            return ECORE_CALLBACK_PASS_ON;
+        },
+        nullptr);
+    (void)handler;
+    return statuses;
 }
 
 } // namespace
+
+void exec_argv(const std::vector<std::string> &argv)
+{
+    std::vector<char *> args;
+    for (const auto &a : argv)
+        args.push_back(const_cast<char *>(a.c_str()));
+    args.push_back(nullptr);
+    execv(args[0], args.data());
+    _exit(127);
+}
 
 TempDir::TempDir(bool set_env)
 {
@@ -46,8 +68,9 @@ TempDir::TempDir(bool set_env)
 
 TempDir::~TempDir()
 {
+    std::error_code ignored; // a folder left behind in /tmp is harmless
     if (path_ != "/tmp")
-        remove_tree(path_);
+        std::filesystem::remove_all(path_, ignored);
 }
 
 bool wait_for(const std::function<bool()> &pred, int timeout_ms)
@@ -89,12 +112,7 @@ int run_program(const std::vector<std::string> &argv, const std::string &input, 
         close(in_pipe[1]);
         close(out_pipe[0]);
         close(out_pipe[1]);
-        std::vector<char *> args;
-        for (const auto &a : argv)
-            args.push_back(const_cast<char *>(a.c_str()));
-        args.push_back(nullptr);
-        execv(args[0], args.data());
-        _exit(127);
+        exec_argv(argv);
     }
     close(in_pipe[0]);
     close(out_pipe[1]);
@@ -114,6 +132,85 @@ int run_program(const std::vector<std::string> &argv, const std::string &input, 
     if (out)
         *out = collected;
     return WIFEXITED(status) ? WEXITSTATUS(status) : -1;
+}
+
+Child::~Child()
+{
+    if (running()) {
+        kill(pid_, SIGKILL);
+        waitpid(pid_, nullptr, 0);
+    }
+}
+
+bool Child::start(const std::vector<std::string> &argv, const std::string &out_path, const Env &env, rlim_t nofile)
+{
+    reaped_by_loop();
+    killed_ = false;
+    pid_ = fork();
+    if (pid_ < 0)
+        return false;
+    if (pid_ == 0) {
+        int in = open("/dev/null", O_RDONLY);
+        dup2(in, 0);
+        int out = out_path.empty() ? -1 : open(out_path.c_str(), O_WRONLY | O_CREAT | O_APPEND, 0600);
+        if (out >= 0) {
+            dup2(out, 1);
+            dup2(out, 2);
+        }
+        for (const auto &kv : env)
+            setenv(kv.first.c_str(), kv.second.c_str(), 1);
+        rlimit limit = {nofile, nofile};
+        if (nofile > 0 && setrlimit(RLIMIT_NOFILE, &limit) != 0)
+            _exit(126);
+        exec_argv(argv);
+    }
+    exited_ = false;
+    return true;
+}
+
+bool Child::running()
+{
+    if (pid_ <= 0 || exited_)
+        return false;
+    int status = 0;
+    pid_t got = waitpid(pid_, &status, WNOHANG);
+    if (got == 0 || (got < 0 && errno != ECHILD))
+        return true;
+    if (got < 0) { // reaped by the main loop: the status comes with its event
+        auto it = reaped_by_loop().find(pid_);
+        if (it == reaped_by_loop().end())
+            return true;
+        status = it->second;
+    }
+    status_ = status;
+    exited_ = true;
+    return false;
+}
+
+void Child::signal(int sig)
+{
+    if (running()) {
+        kill(pid_, sig);
+        killed_ = killed_ || sig == SIGKILL;
+    }
+}
+
+bool Child::wait_exit(int timeout_ms, int *status)
+{
+    bool done = wait_for([this] { return !running(); }, timeout_ms);
+    if (done && status)
+        *status = status_;
+    return done;
+}
+
+bool Child::ended_well() const
+{
+    return exited_ && (exit_status() == 0 || (killed_ && WIFSIGNALED(status_) && WTERMSIG(status_) == SIGKILL));
+}
+
+int Child::exit_status() const
+{
+    return exited_ && WIFEXITED(status_) ? WEXITSTATUS(status_) : -1;
 }
 
 std::string read_file(const std::string &path)

@@ -2,8 +2,12 @@
 // into it, waiting on the main loop for a condition, running programs of the build.
 #pragma once
 
+#include <sys/resource.h>
+#include <sys/types.h>
+
 #include <functional>
 #include <string>
+#include <utility>
 #include <vector>
 
 namespace zv_test {
@@ -34,6 +38,9 @@ std::string bin_path(const std::string &program);
 // Path below the source tree.
 std::string source_path(const std::string &rel);
 
+// In a forked child: executes argv (argv[0] a path), or exits 127.
+[[noreturn]] void exec_argv(const std::vector<std::string> &argv);
+
 // Runs argv (argv[0] a path), feeding input to its standard input; returns its exit
 // status (or -1) and collects standard output into *out when given.
 int run_program(const std::vector<std::string> &argv, const std::string &input = "",
@@ -42,6 +49,37 @@ int run_program(const std::vector<std::string> &argv, const std::string &input =
 // A listening TCP socket on 127.0.0.1 with a port of the system's choosing; -1 on failure.
 // *port receives the port.
 int listen_loopback(int *port, int backlog = 8);
+
+using Env = std::vector<std::pair<std::string, std::string>>;
+
+// A child process whose exit status is never lost, even when the toolkit's main loop reaps it
+// (it reaps every child of the process while it iterates). Standard output and error go to
+// out_path when given; nofile above 0 is its open-file limit (soft and hard). Killed at
+// destruction when it still runs.
+class Child {
+public:
+    Child() = default;
+    Child(const Child &) = delete;
+    Child &operator=(const Child &) = delete;
+    ~Child();
+    bool start(const std::vector<std::string> &argv, const std::string &out_path = "",
+               const Env &env = {}, rlim_t nofile = 0);
+    pid_t pid() const { return pid_; }
+    bool running();
+    void signal(int sig);
+    // Waits (spinning the main loop) for the exit; true when it exited within timeout_ms.
+    bool wait_exit(int timeout_ms, int *status = nullptr);
+    // Exited with status 0, or was killed by this side with SIGKILL.
+    bool ended_well() const;
+    int raw_status() const { return status_; }
+    // The exit status, or -1 when it has not exited normally.
+    int exit_status() const;
+
+private:
+    pid_t pid_ = -1;
+    bool exited_ = true, killed_ = false;
+    int status_ = 0;
+};
 
 std::string read_file(const std::string &path);
 bool write_file(const std::string &path, const std::string &data);
