@@ -1,6 +1,6 @@
 // Logging helpers shared by every module. Each line carries the prefix
 // "file: function(line) > [TID:n] "; errors are red, notes green.
-// Sources under plugin/ log with the tag "zuvo-plugin" (set by their build target).
+// The service client's sources (plugin/) log with the tag "zuvo-plugin" (set by their target).
 #pragma once
 
 #include <dlog.h>
