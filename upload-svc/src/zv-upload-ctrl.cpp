@@ -475,20 +475,12 @@ ServiceRequest *begin_request(AppData *ad, UploadItem *job_item, bool progress, 
     ServiceRequest *handle = renew_request(job_item);
     if (!handle)
         return nullptr;
-    *ret = zv_set_callback_func(handle, _zv_upload_ctrl_resp_cb);
-    if (*ret != ZV_ERROR_NONE) {
+    if ((*ret = zv_set_callback_func(handle, _zv_upload_ctrl_resp_cb)) != ZV_ERROR_NONE)
         ZV_LOGE_AS(func, "zv_set_callback_func fail: %d", *ret);
-        return handle;
-    }
-    if (progress) {
-        *ret = zv_set_progress_callback_func(handle, _zv_upload_ctrl_progress_cb);
-        if (*ret != ZV_ERROR_NONE) {
-            ZV_LOGE_AS(func, "zv_set_progress_callback_func fail: %d", *ret);
-            return handle;
-        }
-    }
-    *ret = zv_set_user_data(handle, ad);
-    if (*ret != ZV_ERROR_NONE)
+    else if (progress && (*ret = zv_set_progress_callback_func(
+                              handle, _zv_upload_ctrl_progress_cb)) != ZV_ERROR_NONE)
+        ZV_LOGE_AS(func, "zv_set_progress_callback_func fail: %d", *ret);
+    else if ((*ret = zv_set_user_data(handle, ad)) != ZV_ERROR_NONE)
         ZV_LOGE_AS(func, "zv_set_user_data fail: %d", *ret);
     return handle;
 }
