@@ -467,21 +467,29 @@ bool job_call_valid(const AppData *ad, const UploadItem *job_item, const char *n
 
 // The set-up every request of a job starts with, for its caller func: a fresh request (null
 // when the job completed meanwhile, see renew_request) whose answers reach the response
-// callback, with progress the progress callback too, with ad. *ret is the first failing
-// step's result, logged with the step's message; the request is returned all the same.
+// callback, with progress the progress callback too, with ad. A failing step is logged with
+// its message; with ret its result is left there and the request returned, without ret the
+// job fails (fail_job) and the result is null.
 ServiceRequest *begin_request(AppData *ad, UploadItem *job_item, bool progress, const char *func,
-                              int *ret)
+                              int *ret = nullptr)
 {
     ServiceRequest *handle = renew_request(job_item);
     if (!handle)
         return nullptr;
-    if ((*ret = zv_set_callback_func(handle, _zv_upload_ctrl_resp_cb)) != ZV_ERROR_NONE)
-        ZV_LOGE_AS(func, "zv_set_callback_func fail: %d", *ret);
-    else if (progress && (*ret = zv_set_progress_callback_func(
+    int step;
+    if ((step = zv_set_callback_func(handle, _zv_upload_ctrl_resp_cb)) != ZV_ERROR_NONE)
+        ZV_LOGE_AS(func, "zv_set_callback_func fail: %d", step);
+    else if (progress && (step = zv_set_progress_callback_func(
                               handle, _zv_upload_ctrl_progress_cb)) != ZV_ERROR_NONE)
-        ZV_LOGE_AS(func, "zv_set_progress_callback_func fail: %d", *ret);
-    else if ((*ret = zv_set_user_data(handle, ad)) != ZV_ERROR_NONE)
-        ZV_LOGE_AS(func, "zv_set_user_data fail: %d", *ret);
+        ZV_LOGE_AS(func, "zv_set_progress_callback_func fail: %d", step);
+    else if ((step = zv_set_user_data(handle, ad)) != ZV_ERROR_NONE)
+        ZV_LOGE_AS(func, "zv_set_user_data fail: %d", step);
+    if (ret) {
+        *ret = step;
+    } else if (step != ZV_ERROR_NONE) {
+        fail_job(job_item);
+        return nullptr;
+    }
     return handle;
 }
 
@@ -709,14 +717,9 @@ void _zv_upload_ctrl_meta_data_upload(AppData *ad, UploadItem *job_item)
     if (!job_call_valid(ad, job_item, "current item is NULL", __func__) ||
         !zv_ext_network_check())
         return;
-    int ret = ZV_ERROR_NONE;
-    ServiceRequest *handle = begin_request(ad, job_item, false, __func__, &ret);
+    ServiceRequest *handle = begin_request(ad, job_item, false, __func__);
     if (!handle)
         return;
-    if (ret != ZV_ERROR_NONE) {
-        fail_job(job_item);
-        return;
-    }
     ZV_CTRL_STEP(zv_set_attr_token(handle, ad->access_token), "zv_set_attr_token fail: %d");
     ZV_CTRL_STEP(zv_set_attr_title(handle, job_item->title), "zv_set_attr_title fail: %d");
     ZV_CTRL_STEP(zv_set_attr_category(handle, ad->category), "zv_set_attr_category fail: %d");
@@ -747,14 +750,9 @@ void _zv_upload_ctrl_data_upload(AppData *ad, UploadItem *job_item)
     ZV_LOG_ENTER();
     if (!job_call_valid(ad, job_item, "current item is NULL", __func__))
         return;
-    int ret = ZV_ERROR_NONE;
-    ServiceRequest *handle = begin_request(ad, job_item, true, __func__, &ret);
+    ServiceRequest *handle = begin_request(ad, job_item, true, __func__);
     if (!handle)
         return;
-    if (ret != ZV_ERROR_NONE) {
-        fail_job(job_item);
-        return;
-    }
     ZV_CTRL_STEP(zv_set_attr_upload_url(handle, job_item->url), "zv_set_attr_upload_url fail: %d");
     ZV_CTRL_STEP(zv_set_attr_file_offset(handle, job_item->offset),
                  "zv_set_attr_file_offset fail: %d");
