@@ -11,7 +11,6 @@
 #include <errno.h>
 #include <fcntl.h>
 #include <glib.h>
-#include <limits.h>
 #include <poll.h>
 #include <signal.h>
 #include <stdio.h>
@@ -36,6 +35,7 @@
 
 #include "app_i18n.h"
 #include "zv-log.h"
+#include "zv-platform-util.h"
 
 struct app_control_s {
     std::string app_id;
@@ -114,39 +114,6 @@ bool valid_text(const char *s, size_t len)
 
 // ---- paths ----
 
-std::string exe_dir()
-{
-    char buf[PATH_MAX];
-    ssize_t n = readlink("/proc/self/exe", buf, sizeof buf - 1);
-    if (n <= 0)
-        return std::string();
-    buf[n] = '\0';
-    GCharPtr dir(g_path_get_dirname(buf));
-    return dir.get();
-}
-
-std::string canonical(const std::string &path)
-{
-    char buf[PATH_MAX];
-    return realpath(path.c_str(), buf) ? std::string(buf) : path;
-}
-
-std::string with_slash(std::string path)
-{
-    if (path.empty() || path.back() != '/')
-        path += '/';
-    return path;
-}
-
-std::string absolute(const std::string &path)
-{
-    if (g_path_is_absolute(path.c_str()))
-        return path;
-    GCharPtr cwd(g_get_current_dir());
-    GCharPtr joined(g_build_filename(cwd.get(), path.c_str(), nullptr));
-    return joined.get();
-}
-
 // Makes every missing folder of path with mode 0700.
 bool make_dirs(const std::string &path)
 {
@@ -155,22 +122,6 @@ bool make_dirs(const std::string &path)
         return false;
     }
     return true;
-}
-
-std::string resource_dir()
-{
-    const char *env = getenv("ZV_RES_DIR");
-    if (env && *env)
-        return with_slash(absolute(env));
-    std::string dir = exe_dir();
-    if (!dir.empty() && canonical(dir) == canonical(ZV_BUILD_BIN_DIR))
-        return with_slash(ZV_BUILD_RES_DIR);
-    if (!dir.empty()) {
-        std::string beside = canonical(dir + "/" + ZV_BIN_TO_RES_DIR);
-        if (g_file_test(beside.c_str(), G_FILE_TEST_IS_DIR))
-            return with_slash(beside);
-    }
-    return with_slash(ZV_INSTALL_RES_DIR);
 }
 
 // ---- the instance ----
@@ -694,7 +645,7 @@ app_control_h parse_arguments(int argc, char **argv)
 
 std::string find_service_program()
 {
-    std::string beside = exe_dir() + "/" + kAppId;
+    std::string beside = zv_platform_exe_dir() + "/" + kAppId;
     if (access(beside.c_str(), X_OK) == 0)
         return beside;
     GCharPtr found(g_find_program_in_path(kAppId));
@@ -1063,7 +1014,7 @@ char *zv_platform_runtime_dir(void)
     const char *env = getenv("ZV_RUNTIME_DIR");
     const char *xdg = getenv("XDG_RUNTIME_DIR");
     if (env && *env)
-        dir = absolute(env);
+        dir = zv_platform_absolute(env);
     else if (xdg && *xdg)
         dir = std::string(xdg) + "/zuvo";
     else
@@ -1084,12 +1035,12 @@ char *zv_platform_runtime_dir(void)
 
 char *app_get_resource_path(void)
 {
-    return strdup(resource_dir().c_str());
+    return strdup(zv_platform_resource_dir().c_str());
 }
 
 char *app_get_shared_resource_path(void)
 {
-    return strdup(resource_dir().c_str());
+    return strdup(zv_platform_resource_dir().c_str());
 }
 
 char *app_get_data_path(void)
@@ -1097,7 +1048,7 @@ char *app_get_data_path(void)
     GCharPtr dir(g_build_filename(g_get_user_data_dir(), kAppId, nullptr));
     if (!make_dirs(dir.get()))
         return nullptr;
-    return strdup(with_slash(dir.get()).c_str());
+    return strdup(zv_platform_with_slash(dir.get()).c_str());
 }
 
 int app_get_id(char **id)

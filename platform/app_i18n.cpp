@@ -12,8 +12,8 @@
 #include <mutex>
 #include <string>
 
-#include "app.h"
 #include "zv-log.h"
+#include "zv-platform-util.h"
 
 namespace {
 
@@ -59,9 +59,7 @@ std::atomic<bool> g_domain_bound{false};
 void i18n_bind_text_domain(void)
 {
     std::call_once(g_locale_ready, prepare_locale);
-    char *res = app_get_resource_path();
-    std::string dir = std::string(res ? res : "") + "locale";
-    free(res);
+    std::string dir = zv_platform_resource_dir() + "locale";
     if (!bindtextdomain(ZV_TEXT_DOMAIN, dir.c_str()))
         ZV_LOGE("bindtextdomain %s failed", dir.c_str());
     bind_textdomain_codeset(ZV_TEXT_DOMAIN, "UTF-8");

@@ -82,8 +82,10 @@ if [[ " $stages " == *" asan "* ]]; then
   echo "== AddressSanitizer + UndefinedBehaviorSanitizer"
   configure build-asan -DZV_SANITIZE=address
   cmake --build build-asan -j"$jobs"
+  # Leak reports carry whole stacks (the libraries have no frame pointers), so that the
+  # suppressions can name the third-party functions that allocate.
   LSAN_OPTIONS="suppressions=$top/tests/sanitizers/lsan.supp:print_suppressions=0" \
-  ASAN_OPTIONS="halt_on_error=1:detect_leaks=1" \
+  ASAN_OPTIONS="halt_on_error=1:detect_leaks=1:fast_unwind_on_malloc=0" \
   UBSAN_OPTIONS="print_stacktrace=1:halt_on_error=1" \
     run_suite "address+undefined, whole suite" build-asan -E '^LargeFileE2ETest\.'
 fi

@@ -204,6 +204,7 @@ class ViewTest : public ::testing::Test
     {
         zv_upload_view_destroy(ad);
         evas_object_del(ad->win);
+        ecore_main_loop_iterate(); // the window's canvas is freed on the loop, not at once
         g_list_free_full(ad->job_list, free_job);
         *ad = AppData{};
         zv_ext_db_close();

@@ -449,6 +449,50 @@ void pause_running_jobs(AppData *ad)
     }
 }
 
+// Checks the arguments of a job operation for its caller func: a null AppData logs
+// "handle is NULL", a null job null_job_message.
+bool job_call_valid(const AppData *ad, const UploadItem *job_item, const char *null_job_message,
+                    const char *func)
+{
+    if (!ad) {
+        ZV_LOGE_AS(func, "handle is NULL");
+        return false;
+    }
+    if (!job_item) {
+        ZV_LOGE_AS(func, "%s", null_job_message);
+        return false;
+    }
+    return true;
+}
+
+// The set-up every request of a job starts with, for its caller func: a fresh request (null
+// when the job completed meanwhile, see renew_request) whose answers reach the response
+// callback, with progress the progress callback too, with ad. A failing step is logged with
+// its message; with ret its result is left there and the request returned, without ret the
+// job fails (fail_job) and the result is null.
+ServiceRequest *begin_request(AppData *ad, UploadItem *job_item, bool progress, const char *func,
+                              int *ret = nullptr)
+{
+    ServiceRequest *handle = renew_request(job_item);
+    if (!handle)
+        return nullptr;
+    int step;
+    if ((step = zv_set_callback_func(handle, _zv_upload_ctrl_resp_cb)) != ZV_ERROR_NONE)
+        ZV_LOGE_AS(func, "zv_set_callback_func fail: %d", step);
+    else if (progress && (step = zv_set_progress_callback_func(
+                              handle, _zv_upload_ctrl_progress_cb)) != ZV_ERROR_NONE)
+        ZV_LOGE_AS(func, "zv_set_progress_callback_func fail: %d", step);
+    else if ((step = zv_set_user_data(handle, ad)) != ZV_ERROR_NONE)
+        ZV_LOGE_AS(func, "zv_set_user_data fail: %d", step);
+    if (ret) {
+        *ret = step;
+    } else if (step != ZV_ERROR_NONE) {
+        fail_job(job_item);
+        return nullptr;
+    }
+    return handle;
+}
+
 } // namespace
 
 // A step of an upload: on a non-zero result, log the step's message and run the failure
@@ -670,23 +714,12 @@ void zv_upload_ctrl_finalize(AppData *ad)
 void _zv_upload_ctrl_meta_data_upload(AppData *ad, UploadItem *job_item)
 {
     ZV_LOG_ENTER();
-    if (!ad) {
-        ZV_LOGE("handle is NULL");
+    if (!job_call_valid(ad, job_item, "current item is NULL", __func__) ||
+        !zv_ext_network_check())
         return;
-    }
-    if (!job_item) {
-        ZV_LOGE("current item is NULL");
-        return;
-    }
-    if (!zv_ext_network_check())
-        return;
-
-    ServiceRequest *handle = renew_request(job_item);
+    ServiceRequest *handle = begin_request(ad, job_item, false, __func__);
     if (!handle)
         return;
-    ZV_CTRL_STEP(zv_set_callback_func(handle, _zv_upload_ctrl_resp_cb),
-                 "zv_set_callback_func fail: %d");
-    ZV_CTRL_STEP(zv_set_user_data(handle, ad), "zv_set_user_data fail: %d");
     ZV_CTRL_STEP(zv_set_attr_token(handle, ad->access_token), "zv_set_attr_token fail: %d");
     ZV_CTRL_STEP(zv_set_attr_title(handle, job_item->title), "zv_set_attr_title fail: %d");
     ZV_CTRL_STEP(zv_set_attr_category(handle, ad->category), "zv_set_attr_category fail: %d");
@@ -715,22 +748,11 @@ void _zv_upload_ctrl_meta_data_upload(AppData *ad, UploadItem *job_item)
 void _zv_upload_ctrl_data_upload(AppData *ad, UploadItem *job_item)
 {
     ZV_LOG_ENTER();
-    if (!ad) {
-        ZV_LOGE("handle is NULL");
+    if (!job_call_valid(ad, job_item, "current item is NULL", __func__))
         return;
-    }
-    if (!job_item) {
-        ZV_LOGE("current item is NULL");
-        return;
-    }
-    ServiceRequest *handle = renew_request(job_item);
+    ServiceRequest *handle = begin_request(ad, job_item, true, __func__);
     if (!handle)
         return;
-    ZV_CTRL_STEP(zv_set_callback_func(handle, _zv_upload_ctrl_resp_cb),
-                 "zv_set_callback_func fail: %d");
-    ZV_CTRL_STEP(zv_set_progress_callback_func(handle, _zv_upload_ctrl_progress_cb),
-                 "zv_set_progress_callback_func fail: %d");
-    ZV_CTRL_STEP(zv_set_user_data(handle, ad), "zv_set_user_data fail: %d");
     ZV_CTRL_STEP(zv_set_attr_upload_url(handle, job_item->url), "zv_set_attr_upload_url fail: %d");
     ZV_CTRL_STEP(zv_set_attr_file_offset(handle, job_item->offset),
                  "zv_set_attr_file_offset fail: %d");
@@ -1010,14 +1032,8 @@ void _zv_upload_ctrl_pipe_complete_cb(void *data, void *buf, unsigned int nbyte)
 void _zv_upload_ctrl_pause_upload(AppData *ad, UploadItem *job_item)
 {
     ZV_LOG_ENTER();
-    if (!ad) {
-        ZV_LOGE("handle is NULL");
+    if (!job_call_valid(ad, job_item, "data is NULL", __func__))
         return;
-    }
-    if (!job_item) {
-        ZV_LOGE("data is NULL");
-        return;
-    }
     ZV_LOGI("%p, %d", (void *)job_item, job_item->historyid);
     sync_job(job_item);
     if (job_item->status == ZV_UPLOAD_STATUS_COMPLETED) {
@@ -1041,14 +1057,8 @@ void _zv_upload_ctrl_pause_upload(AppData *ad, UploadItem *job_item)
 void _zv_upload_ctrl_resume_upload(AppData *ad, UploadItem *job_item)
 {
     ZV_LOG_ENTER();
-    if (!ad) {
-        ZV_LOGE("handle is NULL");
+    if (!job_call_valid(ad, job_item, "data is NULL", __func__))
         return;
-    }
-    if (!job_item) {
-        ZV_LOGE("data is NULL");
-        return;
-    }
     sync_job(job_item);
     if (job_item->status == ZV_UPLOAD_STATUS_COMPLETED) {
         ZV_LOGI("Skip for complete item");
@@ -1061,18 +1071,11 @@ void _zv_upload_ctrl_resume_upload(AppData *ad, UploadItem *job_item)
         return;
     }
 
-    ServiceRequest *handle = renew_request(job_item);
+    int ret = ZV_ERROR_NONE;
+    ServiceRequest *handle = begin_request(ad, job_item, false, __func__, &ret);
     if (!handle) {
         ZV_LOGI("Skip for complete item");
         return;
-    }
-    int ret = zv_set_callback_func(handle, _zv_upload_ctrl_resp_cb);
-    if (ret != ZV_ERROR_NONE)
-        ZV_LOGE("zv_set_callback_func fail: %d", ret);
-    if (ret == ZV_ERROR_NONE) {
-        ret = zv_set_user_data(handle, ad);
-        if (ret != ZV_ERROR_NONE)
-            ZV_LOGE("zv_set_user_data fail: %d", ret);
     }
     if (ret == ZV_ERROR_NONE) {
         ret = zv_set_attr_upload_url(handle, job_item->url);

@@ -141,12 +141,16 @@ void set_badge_picture(Evas_Object *img, bool upload)
     }
 }
 
-void replace_badge_content(Evas_Object *badge, Evas_Object *img)
+// Shows the upload or the cancel picture in a badge button, in the image the button already
+// shows when it has one: a redraw makes no new object.
+void show_badge_picture(Evas_Object *badge, bool upload)
 {
-    Evas_Object *old = elm_object_part_content_unset(badge, "elm.swallow.content");
-    if (old)
-        evas_object_del(old);
-    elm_object_part_content_set(badge, "elm.swallow.content", img);
+    Evas_Object *img = elm_object_part_content_get(badge, "elm.swallow.content");
+    if (!img) {
+        img = elm_image_add(badge);
+        elm_object_part_content_set(badge, "elm.swallow.content", img);
+    }
+    set_badge_picture(img, upload);
 }
 
 // A row's badge, badge layout or check box is going away (the row was unrealized, restyled
@@ -261,22 +265,30 @@ void delete_menu(AppData *ad)
     }
 }
 
+// The job of a row callback's call for the callback func: null data logs "handle is NULL", a
+// null part "part is NULL".
+UploadItem *row_job(void *data, const char *part, const char *func)
+{
+    if (!data) {
+        ZV_LOGE_AS(func, "handle is NULL");
+        return nullptr;
+    }
+    if (!part) {
+        ZV_LOGE_AS(func, "part is NULL");
+        return nullptr;
+    }
+    return static_cast<UploadItem *>(data);
+}
+
 } // namespace
 
 // ---- List rows ----
 
-static char *__zv_upload_list_get_item_text(void *data, Evas_Object *obj, const char *part)
+static char *__zv_upload_list_get_item_text(void *data, Evas_Object *, const char *part)
 {
-    (void)obj;
-    if (!data) {
-        ZV_LOGE("handle is NULL");
+    UploadItem *job = row_job(data, part, __func__);
+    if (!job)
         return nullptr;
-    }
-    if (!part) {
-        ZV_LOGE("part is NULL");
-        return nullptr;
-    }
-    auto *job = static_cast<UploadItem *>(data);
     if (!strcmp(part, "elm.text.main") && job->title)
         return strdup(job->title);
     if (!strcmp(part, "elm.text.sub.left.bottom") && job->display_name)
@@ -284,18 +296,11 @@ static char *__zv_upload_list_get_item_text(void *data, Evas_Object *obj, const 
     return nullptr;
 }
 
-static char *__zv_upload_list_get_complete_item_text(void *data, Evas_Object *obj, const char *part)
+static char *__zv_upload_list_get_complete_item_text(void *data, Evas_Object *, const char *part)
 {
-    (void)obj;
-    if (!data) {
-        ZV_LOGE("handle is NULL");
+    UploadItem *job = row_job(data, part, __func__);
+    if (!job)
         return nullptr;
-    }
-    if (!part) {
-        ZV_LOGE("part is NULL");
-        return nullptr;
-    }
-    auto *job = static_cast<UploadItem *>(data);
     if (!strcmp(part, "elm.text.main.left.top") && job->title)
         return strdup(job->title);
     if (!strcmp(part, "elm.text.sub.left.bottom") && job->status == ZV_UPLOAD_STATUS_COMPLETED &&
@@ -382,26 +387,21 @@ static void __zv_upload_item_badge_btn_clicked_cb(void *data, Evas_Object *obj, 
         ZV_LOGE("Badge button is NULL.");
         return;
     }
-    Evas_Object *image = elm_image_add(job->badge);
     ZV_LOGI("item->status : %d", job->status);
     if (job->status == ZV_UPLOAD_STATUS_UPLOADING) {
         ZV_LOGI("current uploading state. do cancel and showed upload image ");
-        set_badge_picture(image, true);
-        replace_badge_content(job->badge, image);
+        show_badge_picture(job->badge, true);
         if (ad && ad->pause_upload)
             ad->pause_upload(ad, job);
         else
             ZV_LOGE("pause_upload is NULL");
     } else if (job->status == ZV_UPLOAD_STATUS_PAUSED) {
         ZV_LOGI("current pause state. do upload again and showed cancel image ");
-        set_badge_picture(image, false);
-        replace_badge_content(job->badge, image);
+        show_badge_picture(job->badge, false);
         if (ad && ad->resume_upload)
             ad->resume_upload(ad, job);
         else
             ZV_LOGE("resume_upload is NULL");
-    } else {
-        evas_object_del(image);
     }
 }
 
@@ -426,16 +426,14 @@ static Evas_Object *create_badge(Evas_Object *parent, UploadItem *job)
     evas_object_size_hint_align_set(button, EVAS_HINT_FILL, EVAS_HINT_FILL);
     evas_object_smart_callback_add(button, "clicked", __zv_upload_item_badge_btn_clicked_cb, job);
 
-    Evas_Object *image = elm_image_add(button);
     ZV_LOGI("item->status : %d", job->status);
     if (job->status == ZV_UPLOAD_STATUS_PAUSED) {
         ZV_LOGI("show upload image");
-        set_badge_picture(image, true);
+        show_badge_picture(button, true);
     } else {
         ZV_LOGI("show cancel image");
-        set_badge_picture(image, false);
+        show_badge_picture(button, false);
     }
-    elm_object_part_content_set(button, "elm.swallow.content", image);
     elm_object_part_content_set(layout, "elm.swallow.content", button);
     job->badge = button;
     watch_row_object(layout);
@@ -455,60 +453,21 @@ void zv_upload_view_update_badge_button(UploadItem *job_item)
         ZV_LOGE("Badge button is NULL.");
         return;
     }
-    Evas_Object *image = elm_image_add(job_item->badge);
     ZV_LOGI("item->status : %d", job_item->status);
     if (job_item->status == ZV_UPLOAD_STATUS_UPLOADING) {
         ZV_LOGI("current pause state. do upload again and showed cancel image ");
-        set_badge_picture(image, false);
+        show_badge_picture(job_item->badge, false);
     } else if (job_item->status == ZV_UPLOAD_STATUS_PAUSED) {
         ZV_LOGI("current uploading state. do cancel and showed upload image ");
-        set_badge_picture(image, true);
+        show_badge_picture(job_item->badge, true);
     } else {
         // A waiting job shows the cancel picture, as the row build does.
         ZV_LOGI("show cancel image");
-        set_badge_picture(image, false);
+        show_badge_picture(job_item->badge, false);
     }
-    replace_badge_content(job_item->badge, image);
 }
 
 // ---- Row content ----
-
-static Evas_Object *__zv_upload_list_get_item_content(void *data, Evas_Object *obj,
-                                                      const char *part)
-{
-    if (!data) {
-        ZV_LOGE("handle is NULL");
-        return nullptr;
-    }
-    if (!part) {
-        ZV_LOGE("part is NULL");
-        return nullptr;
-    }
-    auto *job = static_cast<UploadItem *>(data);
-    if (!strcmp(part, "elm.icon.1"))
-        return create_thumbnail(obj, job, false, false);
-    if (!strcmp(part, "elm.icon.badge"))
-        return create_badge(obj, job);
-    if (!strcmp(part, "elm.icon") && is_active_status(job->status))
-        return create_progressbar(obj, job);
-    return nullptr;
-}
-
-static Evas_Object *__zv_upload_list_get_complete_item_content(void *data, Evas_Object *obj,
-                                                               const char *part)
-{
-    if (!data) {
-        ZV_LOGE("handle is NULL");
-        return nullptr;
-    }
-    if (!part) {
-        ZV_LOGE("part is NULL");
-        return nullptr;
-    }
-    if (!strcmp(part, "elm.icon.1"))
-        return create_thumbnail(obj, static_cast<UploadItem *>(data), true, false);
-    return nullptr;
-}
 
 // Selection box of an edit row: a check mirroring the job's checked flag; taps go through
 // it to the row.
@@ -539,45 +498,50 @@ static Evas_Object *create_edit_check(Evas_Object *parent, UploadItem *job)
     return layout;
 }
 
+// The contents of a row: the thumbnail; the check box of an edit row, or the badge of a row
+// of the upload list; the progress bar of a job under way. The completed kinds report a
+// thumbnail they could not make (see create_thumbnail).
+static Evas_Object *row_content(Evas_Object *obj, UploadItem *job, const char *part,
+                                bool complete, bool edit)
+{
+    if (!strcmp(part, "elm.icon.1"))
+        return create_thumbnail(obj, job, complete, edit);
+    if (edit && !strcmp(part, "elm.icon.2"))
+        return create_edit_check(obj, job);
+    if (!edit && !complete && !strcmp(part, "elm.icon.badge"))
+        return create_badge(obj, job);
+    if (!complete && !strcmp(part, "elm.icon") && is_active_status(job->status))
+        return create_progressbar(obj, job);
+    return nullptr;
+}
+
+static Evas_Object *__zv_upload_list_get_item_content(void *data, Evas_Object *obj,
+                                                      const char *part)
+{
+    UploadItem *job = row_job(data, part, __func__);
+    return job ? row_content(obj, job, part, false, false) : nullptr;
+}
+
+static Evas_Object *__zv_upload_list_get_complete_item_content(void *data, Evas_Object *obj,
+                                                               const char *part)
+{
+    UploadItem *job = row_job(data, part, __func__);
+    return job ? row_content(obj, job, part, true, false) : nullptr;
+}
+
 static Evas_Object *__zv_upload_list_get_item_content_of_edit_mode(void *data, Evas_Object *obj,
                                                                    const char *part)
 {
-    if (!data) {
-        ZV_LOGE("handle is NULL");
-        return nullptr;
-    }
-    if (!part) {
-        ZV_LOGE("part is NULL");
-        return nullptr;
-    }
-    auto *job = static_cast<UploadItem *>(data);
-    if (!strcmp(part, "elm.icon.1"))
-        return create_thumbnail(obj, job, false, true);
-    if (!strcmp(part, "elm.icon.2"))
-        return create_edit_check(obj, job);
-    if (!strcmp(part, "elm.icon") && is_active_status(job->status))
-        return create_progressbar(obj, job);
-    return nullptr;
+    UploadItem *job = row_job(data, part, __func__);
+    return job ? row_content(obj, job, part, false, true) : nullptr;
 }
 
 static Evas_Object *__zv_upload_list_get_complete_item_content_of_edit_mode(void *data,
                                                                             Evas_Object *obj,
                                                                             const char *part)
 {
-    if (!data) {
-        ZV_LOGE("handle is NULL");
-        return nullptr;
-    }
-    if (!part) {
-        ZV_LOGE("part is NULL");
-        return nullptr;
-    }
-    auto *job = static_cast<UploadItem *>(data);
-    if (!strcmp(part, "elm.icon.1"))
-        return create_thumbnail(obj, job, true, true);
-    if (!strcmp(part, "elm.icon.2"))
-        return create_edit_check(obj, job);
-    return nullptr;
+    UploadItem *job = row_job(data, part, __func__);
+    return job ? row_content(obj, job, part, true, true) : nullptr;
 }
 
 static void __zv_upload_list_item_select_cb(void *data, Evas_Object *obj, void *event_info)

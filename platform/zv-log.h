@@ -1,6 +1,6 @@
 // Logging helpers shared by every module. Each line carries the prefix
 // "file: function(line) > [TID:n] "; errors are red, notes green.
-// Sources under plugin/ log with the tag "zuvo-plugin" (set by their build target).
+// The service client's sources (plugin/) log with the tag "zuvo-plugin" (set by their target).
 #pragma once
 
 #include <dlog.h>
@@ -23,10 +23,12 @@
 #define ZV_LOGD(fmt, ...) ZV_LOG_AT(DLOG_DEBUG, fmt, ##__VA_ARGS__)
 #define ZV_LOGW(fmt, ...) ZV_LOG_AT(DLOG_WARN, fmt, ##__VA_ARGS__)
 
-// Errors, in red.
-#define ZV_LOGE(fmt, ...)                                                                          \
+// Errors, in red. ZV_LOGE_AS logs as the function named func, for a helper that checks or
+// sets up on its caller's behalf.
+#define ZV_LOGE_AS(func, fmt, ...)                                                                 \
     dlog_print(DLOG_ERROR, ZV_LOG_TAG, "%s: %s(%d) > " ZV_LOG_RED "[TID:%d] " fmt ZV_LOG_RESET,    \
-               __FILE_NAME__, __func__, __LINE__, (int)gettid(), ##__VA_ARGS__)
+               __FILE_NAME__, func, __LINE__, (int)gettid(), ##__VA_ARGS__)
+#define ZV_LOGE(fmt, ...) ZV_LOGE_AS(__func__, fmt, ##__VA_ARGS__)
 
 // Notes worth seeing, in green.
 #define ZV_LOGG(fmt, ...)                                                                          \
