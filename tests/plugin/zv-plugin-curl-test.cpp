@@ -1,204 +1,30 @@
-// Transfer engine against loopback servers written here: what goes on the wire, how answers
-// come back, pause / resume / cancel, failures, stopping with requests in flight, and an
-// open-file limit that cannot hold every transfer.
+// Transfer engine against loopback servers: what goes on the wire, how answers come back,
+// pause / resume / cancel, failures, stopping with requests in flight, and an open-file limit
+// that cannot hold every transfer.
 #include <gtest/gtest.h>
 
-#include <arpa/inet.h>
 #include <dirent.h>
 #include <fcntl.h>
-#include <netinet/in.h>
-#include <stdlib.h>
 #include <string.h>
 #include <sys/resource.h>
-#include <sys/socket.h>
-#include <unistd.h>
 
-#include <atomic>
-#include <condition_variable>
-#include <functional>
-#include <mutex>
 #include <optional>
-#include <string>
-#include <thread>
-#include <vector>
+#include <tuple>
 
 #include "zv-plugin-curl.h"
-#include "zv-test-util.h"
+#include "zv-plugin-test-server.h"
 
 namespace
 {
 
+using namespace zv_plugin_test;
 using zv_test::wait_for;
 constexpr int kWaitMs = 20000;
 
 zv_test::LogFile g_log;
 
-const std::string kReset = "<reset>"; // answer: close the connection with a TCP reset
-const std::string kHang = "<hang>";   // answer: say nothing until the server is destroyed
-
-// A threaded HTTP/1.1 server on 127.0.0.1 (port 0). It records every request as raw bytes
-// (head and up to 1 MiB of body) and answers what the test's responder returns. A CONNECT
-// is accepted as a proxy tunnel whose request is served on the same connection. While gated
-// it reads a request's head but waits with its body.
-class LoopbackServer
-{
-  public:
-    explicit LoopbackServer(std::function<std::string()> responder)
-        : responder_(std::move(responder))
-    {
-        listen_fd_ = zv_test::listen_loopback(&port_, 16);
-        if (listen_fd_ < 0)
-            ADD_FAILURE() << "loopback server: " << strerror(errno);
-        acceptor_ = std::thread([this] {
-            int fd;
-            while ((fd = accept4(listen_fd_, nullptr, nullptr, SOCK_CLOEXEC)) >= 0) {
-                std::lock_guard<std::mutex> lock(m_);
-                if (stop_) {
-                    close(fd);
-                    break;
-                }
-                ++connections_;
-                conn_fds_.push_back(fd);
-                workers_.emplace_back([this, fd] { serve(fd); });
-            }
-        });
-    }
-    ~LoopbackServer()
-    {
-        {
-            std::lock_guard<std::mutex> lock(m_);
-            stop_ = true;
-            for (int fd : conn_fds_)
-                shutdown(fd, SHUT_RDWR);
-        }
-        shutdown(listen_fd_, SHUT_RDWR); // ends the blocked accept
-        cv_.notify_all();
-        acceptor_.join();
-        for (std::thread &t : workers_)
-            t.join();
-        close(listen_fd_);
-    }
-
-    int port() const { return port_; }
-    std::string url(const std::string &path = "/") const
-    {
-        return "http://127.0.0.1:" + std::to_string(port_) + path;
-    }
-    void set_gated(bool gated)
-    {
-        std::lock_guard<std::mutex> lock(m_);
-        gated_ = gated;
-        cv_.notify_all();
-    }
-    std::vector<std::string> requests()
-    {
-        std::lock_guard<std::mutex> lock(m_);
-        return requests_;
-    }
-    size_t request_count() { return requests().size(); }
-    std::atomic<long long> body_bytes{0};
-    std::atomic<int> connections_{0};
-    std::atomic<int> closed_by_peer{0};
-
-  private:
-    bool more(int fd, std::string &buf)
-    {
-        char tmp[65536];
-        ssize_t n = recv(fd, tmp, sizeof tmp, 0);
-        if (n == 0)
-            ++closed_by_peer;
-        if (n <= 0)
-            return false;
-        buf.append(tmp, static_cast<size_t>(n));
-        return true;
-    }
-
-    bool read_head(int fd, std::string &buf, std::string &head)
-    {
-        size_t end;
-        while ((end = buf.find("\r\n\r\n")) == std::string::npos) {
-            if (!more(fd, buf))
-                return false;
-        }
-        head = buf.substr(0, end + 4);
-        buf.erase(0, end + 4);
-        return true;
-    }
-
-    void serve(int fd)
-    {
-        const size_t kKeep = 1 << 20;
-        std::string buf, head;
-        while (read_head(fd, buf, head)) {
-            if (head.rfind("CONNECT ", 0) == 0) {
-                record(head);
-                send(fd, "HTTP/1.1 200 OK\r\n\r\n", 19, MSG_NOSIGNAL);
-                continue;
-            }
-            {
-                std::unique_lock<std::mutex> lock(m_);
-                cv_.wait(lock, [this] { return !gated_ || stop_; });
-            }
-            size_t at = head.find("\r\nContent-Length: ");
-            long long left = at == std::string::npos ? 0 : atoll(head.c_str() + at + 18);
-            std::string kept;
-            while (left > 0 && (!buf.empty() || more(fd, buf))) {
-                size_t take = static_cast<size_t>(std::min<long long>(left, buf.size()));
-                kept.append(buf, 0, std::min(take, kKeep - std::min(kept.size(), kKeep)));
-                buf.erase(0, take);
-                left -= static_cast<long long>(take);
-                body_bytes += static_cast<long long>(take);
-            }
-            record(head + kept);
-            std::string answer = responder_();
-            if (answer == kReset) {
-                linger lg{1, 0};
-                setsockopt(fd, SOL_SOCKET, SO_LINGER, &lg, sizeof lg);
-                break;
-            }
-            if (answer == kHang) {
-                std::unique_lock<std::mutex> lock(m_);
-                cv_.wait(lock, [this] { return stop_; });
-                break;
-            }
-            for (size_t sent = 0; sent < answer.size();) {
-                ssize_t n = send(fd, answer.data() + sent, answer.size() - sent, MSG_NOSIGNAL);
-                if (n <= 0)
-                    break;
-                sent += static_cast<size_t>(n);
-            }
-        }
-        close(fd);
-    }
-
-    void record(const std::string &raw)
-    {
-        std::lock_guard<std::mutex> lock(m_);
-        requests_.push_back(raw);
-    }
-
-    std::function<std::string()> responder_;
-    int listen_fd_ = -1;
-    int port_ = 0;
-    std::thread acceptor_;
-    std::mutex m_;
-    std::condition_variable cv_;
-    bool stop_ = false;
-    bool gated_ = false;
-    std::vector<int> conn_fds_;
-    std::vector<std::thread> workers_;
-    std::vector<std::string> requests_;
-};
-
-std::function<std::string()> answer(const std::string &status, const std::string &headers = "",
-                                    const std::string &body = "")
-{
-    std::string text = "HTTP/1.1 " + status + "\r\n" + headers +
-                       "Content-Length: " + std::to_string(body.size()) + "\r\n\r\n" + body;
-    return [text] { return text; };
-}
-
-// What came back for one item, copied on the worker.
+// What came back for one item, copied on the worker. Once an answer is seen (through the
+// lock), the worker writes nothing more and the fields are read directly.
 struct Outcome {
     std::mutex m;
     int calls = 0;
@@ -217,10 +43,7 @@ struct Outcome {
         std::lock_guard<std::mutex> lock(m);
         return progress.size();
     }
-    bool wait_answer()
-    {
-        return wait_for([this] { return call_count() > 0; }, kWaitMs);
-    }
+    bool wait_answer() { return wait_for([this] { return call_count() > 0; }, kWaitMs); }
 };
 
 void on_response(int result, TransferResponse *resp, void *user_data)
@@ -284,12 +107,10 @@ std::string pattern(size_t size)
     return data;
 }
 
-int count_of(const std::string &text, const std::string &needle)
+bool once(const std::string &text, const std::string &needle)
 {
-    int n = 0;
-    for (size_t at = text.find(needle); at != std::string::npos; at = text.find(needle, at + 1))
-        ++n;
-    return n;
+    size_t at = text.find(needle);
+    return at != std::string::npos && at == text.rfind(needle);
 }
 
 class EngineTest : public ::testing::Test
@@ -348,9 +169,9 @@ TEST(EngineItem, SettersRefuseBadValuesAndChangeNothing)
     EXPECT_EQ(zv_curl_set_body(item.p, nullptr, 0), 0);
     EXPECT_EQ(zv_curl_set_timeout(item.p, 0), 0);
     EXPECT_EQ(zv_curl_set_file_info(item.p, "/g", 0, 0), 0);
+    std::vector<std::string> lines;
     for (const char *line : {"A: 1", "B: 2", "C:"})
         zv_curl_set_header(item.p, line);
-    std::vector<std::string> lines;
     for (GList *l = item->header_list; l; l = l->next)
         lines.push_back(static_cast<char *>(l->data));
     EXPECT_EQ(lines, (std::vector<std::string>{"A: 1", "B: 2", "C:"}));
@@ -363,11 +184,22 @@ TEST(EngineItem, SettersRefuseBadValuesAndChangeNothing)
     EXPECT_EQ(zv_curl_new(&item.p), 0);
     EXPECT_NE(item.p, nullptr);
     EXPECT_EQ(zv_curl_new(nullptr), ZV_CURL_ERROR_INVALID_HANDLE);
+
+    // Cancel, pause and resume need an item that was sent; send needs a URL.
+    Item never_sent, no_url;
+    zv_curl_set_url(never_sent.p, "http://127.0.0.1:1/");
+    for (auto op : {zv_curl_cancel_request, zv_curl_pause_request, zv_curl_resume_request}) {
+        EXPECT_EQ(op(nullptr), ZV_CURL_ERROR_INVALID_HANDLE);
+        EXPECT_EQ(op(no_url.p), ZV_CURL_ERROR_INVALID_PARAMETER);
+        EXPECT_EQ(op(never_sent.p), ZV_CURL_ERROR_INVALID_PARAMETER);
+    }
+    EXPECT_EQ(zv_curl_send_request(nullptr), ZV_CURL_ERROR_INVALID_HANDLE);
+    EXPECT_EQ(zv_curl_send_request(no_url.p), ZV_CURL_ERROR_INVALID_PARAMETER);
 }
 
 TEST_F(EngineTest, PostSendsHeadersAndBodyAndGetsTheRawAnswer)
 {
-    LoopbackServer server(answer("201 Created", "Location: http://up/x?id=1\r\n", "ok"));
+    LoopbackServer server(http_answer("201 Created", "Location: http://up/x?id=1\r\n", "ok"));
     Outcome o;
     Item item;
     prepare(item, o, ZV_CURL_HTTP_METHOD_POST, server.url("/feeds/uploads"));
@@ -383,20 +215,37 @@ TEST_F(EngineTest, PostSendsHeadersAndBodyAndGetsTheRawAnswer)
     EXPECT_NE(raw.find("\r\nContent-Length: 8\r\n"), std::string::npos);
     EXPECT_LT(raw.find("X-First: 1"), raw.find("X-Second: 2"));
     EXPECT_EQ(raw.substr(raw.size() - 12), "\r\n\r\n<entry/>");
-    std::lock_guard<std::mutex> lock(o.m);
     EXPECT_EQ(o.calls, 1);
     EXPECT_EQ(o.result, ZV_CURL_ERROR_NONE);
     EXPECT_EQ(o.http_code, 201);
     EXPECT_EQ(*o.header,
               "HTTP/1.1 201 Created\r\nLocation: http://up/x?id=1\r\nContent-Length: 2\r\n\r\n");
     EXPECT_EQ(*o.body, "ok");
+
+    // Any method value but PUT and POST is a GET; a POST without body sends an empty one. An
+    // answer without body is NULL beside its whole header block.
+    const std::pair<int, const char *> methods[] = {
+        {ZV_CURL_HTTP_METHOD_GET, "GET"}, {5, "GET"}, {-1, "GET"}, {ZV_CURL_HTTP_METHOD_POST, "POST"}};
+    LoopbackServer empty(http_answer("200 OK"));
+    for (auto [method, name] : methods) {
+        Outcome o;
+        Item item;
+        prepare(item, o, method, empty.url());
+        exchange(item, o);
+        std::string raw = empty.requests().back();
+        EXPECT_EQ(raw.rfind(std::string(name) + " / HTTP/1.1\r\n", 0), 0u) << raw;
+        EXPECT_EQ(raw.find("Transfer-Encoding"), std::string::npos) << raw;
+        EXPECT_EQ(o.http_code, 200);
+        EXPECT_FALSE(o.body.has_value());
+        EXPECT_EQ(*o.header, "HTTP/1.1 200 OK\r\nContent-Length: 0\r\n\r\n");
+    }
 }
 
 TEST_F(EngineTest, VerboseLogMasksCredentials)
 {
     if (std::string(getenv("ZV_DLOG_FILE")) != g_log.path())
         GTEST_SKIP() << "the log goes elsewhere";
-    LoopbackServer server(answer("200 OK", "", "{}"));
+    LoopbackServer server(http_answer("200 OK", "", "{}"));
     Outcome o;
     Item item;
     prepare(item, o, ZV_CURL_HTTP_METHOD_POST, server.url("/o/oauth2/token"));
@@ -417,144 +266,98 @@ TEST_F(EngineTest, VerboseLogMasksCredentials)
     EXPECT_EQ(log.find("SECRET-"), std::string::npos);
 }
 
-TEST_F(EngineTest, MethodValuesChooseTheRequestLine)
-{
-    LoopbackServer server(answer("200 OK"));
-    const std::pair<int, const char *> cases[] = {
-        {ZV_CURL_HTTP_METHOD_GET, "GET"},
-        {5, "GET"}, // any value but 1 and 2
-        {-1, "GET"},
-        {ZV_CURL_HTTP_METHOD_POST, "POST"}, // without body: an empty one
-    };
-    for (auto [method, name] : cases) {
-        Outcome o;
-        Item item;
-        prepare(item, o, method, server.url());
-        exchange(item, o);
-        std::string raw = server.requests().back();
-        EXPECT_EQ(raw.rfind(std::string(name) + " / HTTP/1.1\r\n", 0), 0u) << raw;
-        EXPECT_EQ(raw.find("Transfer-Encoding"), std::string::npos) << raw;
-        std::lock_guard<std::mutex> lock(o.m);
-        EXPECT_EQ(o.http_code, 200);
-        EXPECT_FALSE(o.body.has_value()); // no body: NULL, and the whole header block
-        EXPECT_EQ(*o.header, "HTTP/1.1 200 OK\r\nContent-Length: 0\r\n\r\n");
-    }
-}
-
+// The file is written from the offset on (sparse before it); bytes it grew by after its size
+// was taken are never sent. The percent is that of the file's offset after each read.
 TEST_F(EngineTest, PutStreamsTheFileFromItsOffsetFramedByContentLength)
 {
-    LoopbackServer server(answer("201 Created", "ETag: \"v1\"\r\n"));
-    // size, offset, bytes the file grew by after its size was taken (never sent)
-    const std::tuple<int64_t, int64_t, int64_t> cases[] = {
-        {1000, 400, 0}, {3 * 1024 * 1024 + 17, 0, 0}, {0, 0, 0}, {600, 100, 5000}};
-    for (auto [size, offset, grown] : cases) {
-        std::string data = pattern(static_cast<size_t>(size + grown));
-        std::string path = tmp_.file("clip-" + std::to_string(size) + ".mp4");
-        ASSERT_TRUE(zv_test::write_file(path, data));
+    LoopbackServer server(http_answer("201 Created", "ETag: \"v1\"\r\n"));
+    struct Case {
+        int64_t size, offset, grown;
+        int first_percent; // -1: left to the read sizes
+    };
+    const Case cases[] = {
+        {1000, 400, 0, 100},      // one read takes all 600 bytes
+        {3 * 1024 * 1024 + 17, 0, 0, -1},
+        {0, 0, 0, 100},           // an empty file is done, and never divides by zero
+        {600, 100, 5000, 100},
+        {5LL << 30, (5LL << 30) - (1 << 20), 0, 99}, // offsets past the 32-bit limits
+    };
+    for (const Case &c : cases) {
+        SCOPED_TRACE(c.size);
+        const std::string path = tmp_.file("clip.mp4"), data = pattern(c.size - c.offset + c.grown);
+        int fd = open(path.c_str(), O_CREAT | O_TRUNC | O_WRONLY, 0600);
+        ASSERT_GE(fd, 0);
+        ASSERT_EQ(pwrite(fd, data.data(), data.size(), c.offset), static_cast<ssize_t>(data.size()));
+        close(fd);
         Outcome o;
         Item item;
-        prepare_put(item, o, server.url("/up?id=7"), path, size, offset);
+        prepare_put(item, o, server.url("/up?id=7"), path, c.size, c.offset);
         exchange(item, o);
 
         std::string raw = server.requests().back();
         size_t head_end = raw.find("\r\n\r\n") + 4;
         std::string head = raw.substr(0, head_end);
-        std::string sent = data.substr(static_cast<size_t>(offset), size - offset);
         EXPECT_EQ(head.rfind("PUT /up?id=7 HTTP/1.1\r\n", 0), 0u) << head;
-        EXPECT_EQ(count_of(head, "Content-Length:"), 1) << head;
-        EXPECT_NE(head.find("Content-Length: " + std::to_string(sent.size())), std::string::npos);
+        EXPECT_TRUE(once(head, "Content-Length: " + std::to_string(c.size - c.offset) + "\r\n"))
+            << head;
+        EXPECT_TRUE(once(head, "Content-Length:")) << head;
         EXPECT_EQ(head.find("Expect"), std::string::npos) << head;
         EXPECT_EQ(head.find("Transfer-Encoding"), std::string::npos) << head;
-        EXPECT_EQ(raw.substr(head_end), sent.substr(0, 1u << 20));
+        EXPECT_EQ(raw.substr(head_end), data.substr(0, std::min<int64_t>(c.size - c.offset, 1 << 20)));
 
-        std::lock_guard<std::mutex> lock(o.m);
         EXPECT_EQ(o.http_code, 201);
-        for (auto [percent, at] : o.progress) // a file of size 0 reports 100
-            EXPECT_EQ(percent, size ? static_cast<int>(100.0 * at / size) : 100) << size;
-        if (size > 0) {
-            ASSERT_FALSE(o.progress.empty());
-            EXPECT_EQ(o.progress.back(), std::make_pair(100, size));
+        ASSERT_FALSE(o.progress.empty());
+        if (c.first_percent >= 0) {
+            EXPECT_EQ(o.progress.front().first, c.first_percent);
         }
-        if (size == 1000) { // the first read takes all 600 bytes, the final one none
+        for (size_t i = 1; i < o.progress.size(); ++i)
+            EXPECT_LE(o.progress[i - 1], o.progress[i]);
+        EXPECT_EQ(o.progress.back(), std::make_pair(100, c.size));
+        if (c.size == 1000) { // the final read gets none
             EXPECT_EQ(o.progress, (decltype(o.progress){{100, 1000}, {100, 1000}}));
         }
     }
 }
 
-TEST_F(EngineTest, PutPastFourGiBCountsOffsetsAndPercentInSixtyFourBits)
-{
-    // The last MiB of a sparse 5 GiB file: every offset is past the 32-bit limits.
-    LoopbackServer server(answer("201 Created"));
-    const int64_t size = 5LL << 30, offset = size - (1 << 20);
-    const std::string tail = pattern(1 << 20);
-    const std::string path = tmp_.file("big.mp4");
-    int fd = open(path.c_str(), O_CREAT | O_WRONLY, 0600);
-    ASSERT_GE(fd, 0);
-    ASSERT_EQ(pwrite(fd, tail.data(), tail.size(), offset), static_cast<ssize_t>(tail.size()));
-    close(fd);
-    Outcome o;
-    Item item;
-    prepare_put(item, o, server.url("/up"), path, size, offset);
-    exchange(item, o);
-
-    std::string raw = server.requests().back();
-    size_t head_end = raw.find("\r\n\r\n") + 4;
-    EXPECT_NE(raw.find("Content-Range: bytes 5367660544-5368709119/5368709120"), std::string::npos);
-    EXPECT_EQ(raw.substr(head_end), tail);
-    std::lock_guard<std::mutex> lock(o.m);
-    ASSERT_FALSE(o.progress.empty());
-    int64_t last = offset;
-    for (auto [percent, at] : o.progress) {
-        EXPECT_GE(at, last);
-        EXPECT_EQ(percent, static_cast<int>(100.0 * at / size));
-        last = at;
-    }
-    EXPECT_EQ(o.progress.front().first, 99);
-    EXPECT_EQ(o.progress.back(), std::make_pair(100, size));
-}
-
 TEST_F(EngineTest, EmptyPutWithoutFileAsksForTheHeldRange)
 {
-    LoopbackServer server(answer("308 Resume Incomplete", "Range: bytes=0-4095\r\n"));
+    LoopbackServer server(http_answer("308 Resume Incomplete", "Range: bytes=0-4095\r\n"));
     Outcome o;
     Item item;
     prepare(item, o, ZV_CURL_HTTP_METHOD_PUT, server.url("/up?id=7"));
-    for (const char *line : {"Content-Range: bytes */*",
-                             "Accept:", "Transfer-Encoding:", "Expect:", "Content-Length: 0"})
+    for (const char *line :
+         {"Content-Range: bytes */*", "Accept:", "Transfer-Encoding:", "Expect:", "Content-Length: 0"})
         zv_curl_set_header(item.p, line);
     exchange(item, o);
     std::string raw = server.requests().at(0);
     EXPECT_EQ(raw.rfind("PUT /up?id=7 HTTP/1.1\r\n", 0), 0u);
-    EXPECT_EQ(count_of(raw, "Content-Length:"), 1) << raw;
+    EXPECT_TRUE(once(raw, "Content-Length:")) << raw;
     for (const char *absent : {"Accept:", "Expect:", "Transfer-Encoding:"})
         EXPECT_EQ(raw.find(absent), std::string::npos) << absent;
     EXPECT_EQ(raw.substr(raw.size() - 4), "\r\n\r\n"); // no body
-    std::lock_guard<std::mutex> lock(o.m);
     EXPECT_EQ(o.http_code, 308);
     EXPECT_NE(o.header->find("Range: bytes=0-4095\r\n"), std::string::npos);
 }
 
 TEST_F(EngineTest, ProxyIsUsedUnlessEmptyOrUnspecifiedAddress)
 {
-    LoopbackServer target(answer("200 OK", "", "direct"));
-    LoopbackServer proxy(answer("200 OK", "", "tunnel"));
-    std::string proxy_addr = "127.0.0.1:" + std::to_string(proxy.port());
-    const std::pair<const char *, bool> cases[] = {
-        {proxy_addr.c_str(), true}, {"0.0.0.0:8080", false}, {"", false}, {nullptr, false}};
-    for (auto [proxy_text, via_proxy] : cases) {
+    LoopbackServer target(http_answer("200 OK", "", "direct"));
+    LoopbackServer proxy(http_answer("200 OK", "", "tunnel"));
+    const std::pair<std::string, bool> cases[] = {
+        {proxy.host(), true}, {"0.0.0.0:8080", false}, {"", false}, {"NULL", false}};
+    for (const auto &[proxy_text, via_proxy] : cases) {
         Outcome o;
         Item item;
         prepare(item, o, ZV_CURL_HTTP_METHOD_GET, target.url("/doc"));
-        zv_curl_set_netwrok_info(item.p, "10.0.0.5", proxy_text);
+        zv_curl_set_netwrok_info(item.p, "10.0.0.5",
+                                 proxy_text == "NULL" ? nullptr : proxy_text.c_str());
         size_t through_proxy = proxy.request_count();
         exchange(item, o);
-        std::lock_guard<std::mutex> lock(o.m);
-        EXPECT_EQ(*o.body, via_proxy ? "tunnel" : "direct") << (proxy_text ? proxy_text : "NULL");
+        EXPECT_EQ(*o.body, via_proxy ? "tunnel" : "direct") << proxy_text;
         if (via_proxy) { // tunnelled through a CONNECT to the target
             auto seen = proxy.requests();
             ASSERT_EQ(seen.size(), through_proxy + 2);
-            std::string connect = "CONNECT 127.0.0.1:" + std::to_string(target.port());
-            EXPECT_EQ(seen[through_proxy].rfind(connect, 0), 0u) << seen[through_proxy];
+            EXPECT_EQ(seen[through_proxy].rfind("CONNECT " + target.host(), 0), 0u);
             EXPECT_EQ(seen[through_proxy + 1].rfind("GET /doc HTTP/1.1", 0), 0u);
         }
     }
@@ -564,16 +367,13 @@ TEST_F(EngineTest, ProxyIsUsedUnlessEmptyOrUnspecifiedAddress)
 // A request without a whole answer is reported once, as no answer: status 0, no data.
 TEST_F(EngineTest, FailedRequestsCompleteWithStatusZeroAndNoData)
 {
-    int closed_port = LoopbackServer(answer("200 OK")).port();
-    LoopbackServer reset([] { return kReset; });
-    LoopbackServer silent([] { return kHang; });
-    LoopbackServer big_head([] {
-        std::string head = "HTTP/1.1 200 OK\r\n";
-        while (head.size() < ZV_CURL_MAX_RESPONSE_SIZE + 4096)
-            head += "X-Pad: " + std::string(1000, 'p') + "\r\n";
-        return head + "Content-Length: 0\r\n\r\n";
-    });
-    LoopbackServer big_body(answer("200 OK", "", std::string(ZV_CURL_MAX_RESPONSE_SIZE, 'b')));
+    int closed_port = LoopbackServer(http_answer("200 OK")).port();
+    LoopbackServer reset(kReset), silent(kHang);
+    std::string head = "HTTP/1.1 200 OK\r\n";
+    while (head.size() < ZV_CURL_MAX_RESPONSE_SIZE + 4096)
+        head += "X-Pad: " + std::string(1000, 'p') + "\r\n";
+    LoopbackServer big_head(head + "Content-Length: 0\r\n\r\n");
+    LoopbackServer big_body(http_answer("200 OK", "", std::string(ZV_CURL_MAX_RESPONSE_SIZE, 'b')));
     const std::pair<const char *, std::string> cases[] = {
         {"closed port", "http://127.0.0.1:" + std::to_string(closed_port) + "/"},
         {"reset", reset.url()},
@@ -588,8 +388,7 @@ TEST_F(EngineTest, FailedRequestsCompleteWithStatusZeroAndNoData)
         zv_curl_set_body(item.p, "q=1", 3);
         zv_curl_set_timeout(item.p, 1000);
         exchange(item, o);
-        std::lock_guard<std::mutex> lock(o.m);
-        EXPECT_EQ(o.calls, 1) << what;
+        EXPECT_EQ(o.call_count(), 1) << what;
         EXPECT_EQ(o.result, ZV_CURL_ERROR_NONE) << what;
         EXPECT_EQ(o.http_code, 0) << what;
         EXPECT_FALSE(o.header.has_value()) << what;
@@ -597,27 +396,13 @@ TEST_F(EngineTest, FailedRequestsCompleteWithStatusZeroAndNoData)
     }
 
     // One byte less fits.
-    LoopbackServer fits(answer("200 OK", "", std::string(ZV_CURL_MAX_RESPONSE_SIZE - 1, 'b')));
+    LoopbackServer fits(http_answer("200 OK", "", std::string(ZV_CURL_MAX_RESPONSE_SIZE - 1, 'b')));
     Outcome o;
     Item item;
     prepare(item, o, ZV_CURL_HTTP_METHOD_GET, fits.url());
     exchange(item, o);
-    std::lock_guard<std::mutex> lock(o.m);
     EXPECT_EQ(o.http_code, 200);
     EXPECT_EQ(o.body.value_or("").size(), ZV_CURL_MAX_RESPONSE_SIZE - 1u);
-}
-
-TEST_F(EngineTest, CancelPauseResumeCheckTheirItem)
-{
-    Item never_sent, no_url;
-    zv_curl_set_url(never_sent.p, "http://127.0.0.1:1/");
-    for (auto op : {zv_curl_cancel_request, zv_curl_pause_request, zv_curl_resume_request}) {
-        EXPECT_EQ(op(nullptr), ZV_CURL_ERROR_INVALID_HANDLE);
-        EXPECT_EQ(op(no_url.p), ZV_CURL_ERROR_INVALID_PARAMETER);
-        EXPECT_EQ(op(never_sent.p), ZV_CURL_ERROR_INVALID_PARAMETER);
-    }
-    EXPECT_EQ(zv_curl_send_request(nullptr), ZV_CURL_ERROR_INVALID_HANDLE);
-    EXPECT_EQ(zv_curl_send_request(no_url.p), ZV_CURL_ERROR_INVALID_PARAMETER);
 }
 
 // From a response callback (worker thread, lock held) the calls that would deadlock are
@@ -628,22 +413,19 @@ struct Reentry {
     TransferItem *item = nullptr;
 };
 
-void reentrant_response(int, TransferResponse *, void *user_data)
-{
-    Reentry *r = static_cast<Reentry *>(user_data);
-    r->send_result = zv_curl_send_request(r->item);
-    r->cancel_result = zv_curl_cancel_request(r->item);
-    zv_curl_free(r->item);
-    zv_curl_new(&r->item); // the old record is reclaimed after this report
-    r->done = true;
-}
-
 TEST_F(EngineTest, ResponseCallbackMayReleaseItsItemButNotCallBackIn)
 {
-    LoopbackServer server(answer("200 OK", "", "x"));
+    LoopbackServer server(http_answer("200 OK", "", "x"));
     Reentry r;
     zv_curl_new(&r.item);
-    zv_curl_set_callback_func(r.item, reentrant_response);
+    zv_curl_set_callback_func(r.item, [](int, TransferResponse *, void *user_data) {
+        Reentry *r = static_cast<Reentry *>(user_data);
+        r->send_result = zv_curl_send_request(r->item);
+        r->cancel_result = zv_curl_cancel_request(r->item);
+        zv_curl_free(r->item);
+        zv_curl_new(&r->item); // the old record is reclaimed after this report
+        r->done = true;
+    });
     zv_curl_set_user_data(r.item, &r);
     zv_curl_set_url(r.item, server.url().c_str());
     ASSERT_EQ(zv_curl_send_request(r.item), 0);
@@ -686,8 +468,18 @@ class RunningUploadTest : public EngineTest
         EXPECT_EQ(other.http_code, 200);
     }
 
-    LoopbackServer server_{answer("201 Created")};
-    LoopbackServer side_{answer("200 OK")};
+    // Cancelling or deleting the held upload closes its connection, and no answer follows.
+    void expect_dropped()
+    {
+        server_.set_gated(false);
+        EXPECT_TRUE(wait_for([this] { return server_.closed_by_peer > 0; }, kWaitMs));
+        run_another_request();
+        EXPECT_EQ(o_.call_count(), 0);
+        EXPECT_LT(server_.body_bytes, kSize);
+    }
+
+    LoopbackServer server_{http_answer("201 Created")};
+    LoopbackServer side_{http_answer("200 OK")};
     Outcome o_;
     Item upload_;
 };
@@ -704,21 +496,16 @@ TEST_F(RunningUploadTest, PauseHoldsTheRequestAndResumeFinishesItOnTheSameConnec
 
     ASSERT_EQ(zv_curl_resume_request(upload_.p), 0);
     ASSERT_TRUE(o_.wait_answer());
-    std::lock_guard<std::mutex> lock(o_.m);
     EXPECT_EQ(o_.http_code, 201);
     EXPECT_EQ(o_.progress.back(), std::make_pair(100, static_cast<int64_t>(kSize)));
     EXPECT_EQ(server_.body_bytes, kSize);
-    EXPECT_EQ(server_.connections_, 1);
+    EXPECT_EQ(server_.connections, 1);
 }
 
 TEST_F(RunningUploadTest, CancelClosesTheConnectionAndNoAnswerFollows)
 {
     ASSERT_EQ(zv_curl_cancel_request(upload_.p), 0);
-    server_.set_gated(false);
-    EXPECT_TRUE(wait_for([this] { return server_.closed_by_peer > 0; }, kWaitMs));
-    run_another_request();
-    EXPECT_EQ(o_.call_count(), 0);
-    EXPECT_LT(server_.body_bytes, kSize);
+    expect_dropped();
     EXPECT_EQ(zv_curl_cancel_request(upload_.p), ZV_CURL_ERROR_INVALID_PARAMETER);
 }
 
@@ -726,15 +513,12 @@ TEST_F(RunningUploadTest, DeletingTheItemDetachesItsTransfer)
 {
     zv_curl_delete(&upload_.p);
     EXPECT_EQ(upload_.p, nullptr);
-    server_.set_gated(false);
-    EXPECT_TRUE(wait_for([this] { return server_.closed_by_peer > 0; }, kWaitMs));
-    run_another_request();
-    EXPECT_EQ(o_.call_count(), 0);
+    expect_dropped();
 }
 
 TEST_F(RunningUploadTest, StopNeverHangsWithRequestsInFlight)
 {
-    LoopbackServer silent([] { return kHang; });
+    LoopbackServer silent(kHang);
     Outcome hanging;
     Item query;
     prepare(query, hanging, ZV_CURL_HTTP_METHOD_GET, silent.url());
@@ -796,8 +580,8 @@ TEST(EngineFileLimit, TransfersPastTheLimitWaitTheirTurnAndAllComplete)
     setrlimit(RLIMIT_NOFILE, &saved); // the servers of the test need their own descriptors
     ASSERT_EQ(started, ZV_CURL_ERROR_NONE);
 
-    LoopbackServer held(answer("201 Created"));
-    LoopbackServer fast(answer("200 OK"));
+    LoopbackServer held(http_answer("201 Created"));
+    LoopbackServer fast(http_answer("200 OK"));
     held.set_gated(true);
     std::string path = tmp.file("clip.mp4");
     ASSERT_TRUE(zv_test::write_file(path, pattern(4096)));
@@ -815,14 +599,13 @@ TEST(EngineFileLimit, TransfersPastTheLimitWaitTheirTurnAndAllComplete)
     }
     // Longer than the waiting requests' time-out.
     std::this_thread::sleep_for(std::chrono::milliseconds(1500));
-    EXPECT_GE(held.connections_, 1);
-    EXPECT_LE(held.connections_, kSpare / 2);
-    EXPECT_EQ(fast.connections_, 0) << "the later requests wait while the held ones run";
+    EXPECT_GE(held.connections, 1);
+    EXPECT_LE(held.connections, kSpare / 2);
+    EXPECT_EQ(fast.connections, 0) << "the later requests wait while the held ones run";
 
     held.set_gated(false);
     for (int i = 0; i < kHeld + kWaiting; ++i) {
         ASSERT_TRUE(outcomes[i].wait_answer()) << i;
-        std::lock_guard<std::mutex> lock(outcomes[i].m);
         EXPECT_EQ(outcomes[i].http_code, i < kHeld ? 201 : 200) << i;
     }
     EXPECT_EQ(descriptors(path), 0);
