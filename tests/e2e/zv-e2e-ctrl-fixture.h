@@ -23,7 +23,7 @@ using zv_upload_test::run_until;
 using zv_upload_test::stored_rows;
 
 // The log of this process, in one file with marks.
-inline zv_upload_test::LogFile g_log;
+inline zv_test::LogFile g_log;
 
 // The controller in this process with a real window, list view, service client and worker
 // thread, against the development server, with the history file of a temporary folder.

@@ -1,12 +1,9 @@
 // Transfer engine against loopback servers: what goes on the wire, how answers come back,
-// pause / resume / cancel, failures, stopping with requests in flight, and an open-file limit
-// that cannot hold every transfer.
+// pause / resume / cancel, failures, and stopping with requests in flight.
 #include <gtest/gtest.h>
 
-#include <dirent.h>
 #include <fcntl.h>
 #include <string.h>
-#include <sys/resource.h>
 
 #include <optional>
 #include <tuple>
@@ -43,7 +40,10 @@ struct Outcome {
         std::lock_guard<std::mutex> lock(m);
         return progress.size();
     }
-    bool wait_answer() { return wait_for([this] { return call_count() > 0; }, kWaitMs); }
+    bool wait_answer()
+    {
+        return wait_for([this] { return call_count() > 0; }, kWaitMs);
+    }
 };
 
 void on_response(int result, TransferResponse *resp, void *user_data)
@@ -85,17 +85,12 @@ void prepare(Item &item, Outcome &o, int method, const std::string &url)
     zv_curl_set_connect_timeout(item.p, 30000);
 }
 
-// A PUT of `path` from `offset` with the headers of a data upload.
+// A PUT of `path` from `offset`, framed as a data upload is.
 void prepare_put(Item &item, Outcome &o, const std::string &url, const std::string &path,
                  int64_t size, int64_t offset)
 {
     prepare(item, o, ZV_CURL_HTTP_METHOD_PUT, url);
-    std::string range = "Content-Range: bytes " + std::to_string(offset) + "-" +
-                        std::to_string(size - 1) + "/" + std::to_string(size);
-    std::string length = "Content-Length: " + std::to_string(size - offset);
-    zv_curl_set_header(item.p, "Content-Type: video/mp4");
-    zv_curl_set_header(item.p, range.c_str());
-    zv_curl_set_header(item.p, length.c_str());
+    zv_curl_set_header(item.p, ("Content-Length: " + std::to_string(size - offset)).c_str());
     ASSERT_EQ(zv_curl_set_file_info(item.p, path.c_str(), size, offset), 0);
 }
 
@@ -224,8 +219,10 @@ TEST_F(EngineTest, PostSendsHeadersAndBodyAndGetsTheRawAnswer)
 
     // Any method value but PUT and POST is a GET; a POST without body sends an empty one. An
     // answer without body is NULL beside its whole header block.
-    const std::pair<int, const char *> methods[] = {
-        {ZV_CURL_HTTP_METHOD_GET, "GET"}, {5, "GET"}, {-1, "GET"}, {ZV_CURL_HTTP_METHOD_POST, "POST"}};
+    const std::pair<int, const char *> methods[] = {{ZV_CURL_HTTP_METHOD_GET, "GET"},
+                                                    {5, "GET"},
+                                                    {-1, "GET"},
+                                                    {ZV_CURL_HTTP_METHOD_POST, "POST"}};
     LoopbackServer empty(http_answer("200 OK"));
     for (auto [method, name] : methods) {
         Outcome o;
@@ -276,9 +273,9 @@ TEST_F(EngineTest, PutStreamsTheFileFromItsOffsetFramedByContentLength)
         int first_percent; // -1: left to the read sizes
     };
     const Case cases[] = {
-        {1000, 400, 0, 100},      // one read takes all 600 bytes
+        {1000, 400, 0, 100}, // one read takes all 600 bytes
         {3 * 1024 * 1024 + 17, 0, 0, -1},
-        {0, 0, 0, 100},           // an empty file is done, and never divides by zero
+        {0, 0, 0, 100}, // an empty file is done, and never divides by zero
         {600, 100, 5000, 100},
         {5LL << 30, (5LL << 30) - (1 << 20), 0, 99}, // offsets past the 32-bit limits
     };
@@ -287,7 +284,8 @@ TEST_F(EngineTest, PutStreamsTheFileFromItsOffsetFramedByContentLength)
         const std::string path = tmp_.file("clip.mp4"), data = pattern(c.size - c.offset + c.grown);
         int fd = open(path.c_str(), O_CREAT | O_TRUNC | O_WRONLY, 0600);
         ASSERT_GE(fd, 0);
-        ASSERT_EQ(pwrite(fd, data.data(), data.size(), c.offset), static_cast<ssize_t>(data.size()));
+        ASSERT_EQ(pwrite(fd, data.data(), data.size(), c.offset),
+                  static_cast<ssize_t>(data.size()));
         close(fd);
         Outcome o;
         Item item;
@@ -303,7 +301,8 @@ TEST_F(EngineTest, PutStreamsTheFileFromItsOffsetFramedByContentLength)
         EXPECT_TRUE(once(head, "Content-Length:")) << head;
         EXPECT_EQ(head.find("Expect"), std::string::npos) << head;
         EXPECT_EQ(head.find("Transfer-Encoding"), std::string::npos) << head;
-        EXPECT_EQ(raw.substr(head_end), data.substr(0, std::min<int64_t>(c.size - c.offset, 1 << 20)));
+        EXPECT_EQ(raw.substr(head_end),
+                  data.substr(0, std::min<int64_t>(c.size - c.offset, 1 << 20)));
 
         EXPECT_EQ(o.http_code, 201);
         ASSERT_FALSE(o.progress.empty());
@@ -325,8 +324,8 @@ TEST_F(EngineTest, EmptyPutWithoutFileAsksForTheHeldRange)
     Outcome o;
     Item item;
     prepare(item, o, ZV_CURL_HTTP_METHOD_PUT, server.url("/up?id=7"));
-    for (const char *line :
-         {"Content-Range: bytes */*", "Accept:", "Transfer-Encoding:", "Expect:", "Content-Length: 0"})
+    for (const char *line : {"Content-Range: bytes */*",
+                             "Accept:", "Transfer-Encoding:", "Expect:", "Content-Length: 0"})
         zv_curl_set_header(item.p, line);
     exchange(item, o);
     std::string raw = server.requests().at(0);
@@ -468,16 +467,6 @@ class RunningUploadTest : public EngineTest
         EXPECT_EQ(other.http_code, 200);
     }
 
-    // Cancelling or deleting the held upload closes its connection, and no answer follows.
-    void expect_dropped()
-    {
-        server_.set_gated(false);
-        EXPECT_TRUE(wait_for([this] { return server_.closed_by_peer > 0; }, kWaitMs));
-        run_another_request();
-        EXPECT_EQ(o_.call_count(), 0);
-        EXPECT_LT(server_.body_bytes, kSize);
-    }
-
     LoopbackServer server_{http_answer("201 Created")};
     LoopbackServer side_{http_answer("200 OK")};
     Outcome o_;
@@ -505,15 +494,12 @@ TEST_F(RunningUploadTest, PauseHoldsTheRequestAndResumeFinishesItOnTheSameConnec
 TEST_F(RunningUploadTest, CancelClosesTheConnectionAndNoAnswerFollows)
 {
     ASSERT_EQ(zv_curl_cancel_request(upload_.p), 0);
-    expect_dropped();
+    server_.set_gated(false);
+    EXPECT_TRUE(wait_for([this] { return server_.closed_by_peer > 0; }, kWaitMs));
+    run_another_request();
+    EXPECT_EQ(o_.call_count(), 0);
+    EXPECT_LT(server_.body_bytes, kSize);
     EXPECT_EQ(zv_curl_cancel_request(upload_.p), ZV_CURL_ERROR_INVALID_PARAMETER);
-}
-
-TEST_F(RunningUploadTest, DeletingTheItemDetachesItsTransfer)
-{
-    zv_curl_delete(&upload_.p);
-    EXPECT_EQ(upload_.p, nullptr);
-    expect_dropped();
 }
 
 TEST_F(RunningUploadTest, StopNeverHangsWithRequestsInFlight)
@@ -543,73 +529,6 @@ TEST_F(RunningUploadTest, StopNeverHangsWithRequestsInFlight)
     ASSERT_EQ(zv_curl_init_service(), ZV_CURL_ERROR_NONE);
     server_.set_gated(false);
     run_another_request();
-}
-
-// The descriptors of this process: how many, or how many name `path`.
-int descriptors(const std::string &path = "")
-{
-    int n = 0;
-    DIR *dir = opendir("/proc/self/fd");
-    while (const dirent *entry = dir ? readdir(dir) : nullptr) {
-        char target[4096];
-        std::string link = std::string("/proc/self/fd/") + entry->d_name;
-        ssize_t len = readlink(link.c_str(), target, sizeof target - 1);
-        if (entry->d_name[0] != '.' &&
-            (path.empty() || std::string(target, len > 0 ? len : 0) == path))
-            ++n;
-    }
-    if (dir)
-        closedir(dir);
-    return path.empty() ? n - 1 : n;
-}
-
-// Started under an open-file limit with 40 descriptors to spare, the engine runs at most as
-// many transfers as they can hold (a connection and a file each); the others wait in the
-// engine, and their wait does not count against their time-out. A finished upload keeps no
-// descriptor of its file.
-TEST(EngineFileLimit, TransfersPastTheLimitWaitTheirTurnAndAllComplete)
-{
-    zv_test::TempDir tmp;
-    const int kSpare = 40;
-    rlimit saved;
-    ASSERT_EQ(getrlimit(RLIMIT_NOFILE, &saved), 0);
-    rlimit low = saved;
-    low.rlim_cur = static_cast<rlim_t>(descriptors() + kSpare);
-    ASSERT_EQ(setrlimit(RLIMIT_NOFILE, &low), 0);
-    int started = zv_curl_init_service();
-    setrlimit(RLIMIT_NOFILE, &saved); // the servers of the test need their own descriptors
-    ASSERT_EQ(started, ZV_CURL_ERROR_NONE);
-
-    LoopbackServer held(http_answer("201 Created"));
-    LoopbackServer fast(http_answer("200 OK"));
-    held.set_gated(true);
-    std::string path = tmp.file("clip.mp4");
-    ASSERT_TRUE(zv_test::write_file(path, pattern(4096)));
-    const int kHeld = kSpare / 2 + 1, kWaiting = 20;
-    std::vector<Outcome> outcomes(kHeld + kWaiting);
-    std::vector<Item> items(kHeld + kWaiting);
-    for (int i = 0; i < kHeld + kWaiting; ++i) {
-        if (i < kHeld) {
-            prepare_put(items[i], outcomes[i], held.url("/up"), path, 4096, 0);
-        } else {
-            prepare(items[i], outcomes[i], ZV_CURL_HTTP_METHOD_GET, fast.url());
-            zv_curl_set_timeout(items[i].p, 1000);
-        }
-        ASSERT_EQ(zv_curl_send_request(items[i].p), 0);
-    }
-    // Longer than the waiting requests' time-out.
-    std::this_thread::sleep_for(std::chrono::milliseconds(1500));
-    EXPECT_GE(held.connections, 1);
-    EXPECT_LE(held.connections, kSpare / 2);
-    EXPECT_EQ(fast.connections, 0) << "the later requests wait while the held ones run";
-
-    held.set_gated(false);
-    for (int i = 0; i < kHeld + kWaiting; ++i) {
-        ASSERT_TRUE(outcomes[i].wait_answer()) << i;
-        EXPECT_EQ(outcomes[i].http_code, i < kHeld ? 201 : 200) << i;
-    }
-    EXPECT_EQ(descriptors(path), 0);
-    zv_curl_finalize_service();
 }
 
 } // namespace

@@ -20,6 +20,7 @@ TEST(PluginUtil, MediaTypeFromTheLastExtension)
 {
     // A path longer than the working buffer is cut: its extension past 4095 is lost.
     const std::string cut = std::string(4095, 'a') + ".mp4", fits = std::string(4090, 'a') + ".mp4";
+    // clang-format off
     const std::pair<const char *, const char *> cases[] = { // NULL type: unknown
         {"/media/DCIM/Clip.MP4", "video/mp4"}, {"/media/a.JPEG", "image/jpeg"},
         {"a.jpg", "image/jpeg"}, {"x.png", "image/png"}, {"x.BMP", "image/bmp"},
@@ -31,6 +32,7 @@ TEST(PluginUtil, MediaTypeFromTheLastExtension)
         {"x.mkv", NULL}, {"x.mp4 ", NULL}, {"/dir.old/clip", NULL}, {"/dir.mp4/clip", NULL},
         {NULL, NULL}, {cut.c_str(), NULL}, {fits.c_str(), "video/mp4"},
     };
+    // clang-format on
     for (auto [path, type] : cases) {
         const char *got = zv_plugin_util_get_file_mime(path);
         EXPECT_EQ(std::string(got ? got : "NULL"), type ? type : "NULL") << (path ? path : "NULL");
