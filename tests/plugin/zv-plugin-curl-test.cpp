@@ -5,6 +5,7 @@
 #include <fcntl.h>
 #include <string.h>
 
+#include <memory>
 #include <optional>
 #include <tuple>
 
@@ -66,33 +67,30 @@ void on_progress(int percent, void *user_data, int64_t, int64_t file_offset)
     o->progress.emplace_back(percent, file_offset);
 }
 
-// An item record, deleted through the engine when the test ends.
-struct Item {
+// An item record with what came back for it, deleted through the engine when the test ends.
+struct Item : Outcome {
     TransferItem *p = nullptr;
     Item() { zv_curl_new(&p); }
+    Item(int method, const std::string &url) : Item()
+    {
+        zv_curl_set_callback_func(p, on_response);
+        zv_curl_set_progress_cb_func(p, on_progress);
+        zv_curl_set_user_data(p, static_cast<Outcome *>(this));
+        zv_curl_set_method(p, method);
+        zv_curl_set_url(p, url.c_str());
+        zv_curl_set_timeout(p, 60000);
+        zv_curl_set_connect_timeout(p, 30000);
+    }
+    // A PUT of `path` from `offset`, framed as a data upload is.
+    Item(const std::string &url, const std::string &path, int64_t size, int64_t offset)
+        : Item(ZV_CURL_HTTP_METHOD_PUT, url)
+    {
+        zv_curl_set_header(p, ("Content-Length: " + std::to_string(size - offset)).c_str());
+        EXPECT_EQ(zv_curl_set_file_info(p, path.c_str(), size, offset), 0);
+    }
     ~Item() { zv_curl_delete(&p); }
     TransferItem *operator->() { return p; }
 };
-
-void prepare(Item &item, Outcome &o, int method, const std::string &url)
-{
-    zv_curl_set_callback_func(item.p, on_response);
-    zv_curl_set_progress_cb_func(item.p, on_progress);
-    zv_curl_set_user_data(item.p, &o);
-    zv_curl_set_method(item.p, method);
-    zv_curl_set_url(item.p, url.c_str());
-    zv_curl_set_timeout(item.p, 60000);
-    zv_curl_set_connect_timeout(item.p, 30000);
-}
-
-// A PUT of `path` from `offset`, framed as a data upload is.
-void prepare_put(Item &item, Outcome &o, const std::string &url, const std::string &path,
-                 int64_t size, int64_t offset)
-{
-    prepare(item, o, ZV_CURL_HTTP_METHOD_PUT, url);
-    zv_curl_set_header(item.p, ("Content-Length: " + std::to_string(size - offset)).c_str());
-    ASSERT_EQ(zv_curl_set_file_info(item.p, path.c_str(), size, offset), 0);
-}
 
 std::string pattern(size_t size)
 {
@@ -120,9 +118,9 @@ class EngineTest : public ::testing::Test
     void TearDown() override { zv_curl_finalize_service(); }
 
     // Sends a prepared item and waits for its answer.
-    void exchange(Item &item, Outcome &o)
+    void exchange(Item &o)
     {
-        ASSERT_EQ(zv_curl_send_request(item.p), 0);
+        ASSERT_EQ(zv_curl_send_request(o.p), 0);
         ASSERT_TRUE(o.wait_answer());
     }
 
@@ -195,14 +193,12 @@ TEST(EngineItem, SettersRefuseBadValuesAndChangeNothing)
 TEST_F(EngineTest, PostSendsHeadersAndBodyAndGetsTheRawAnswer)
 {
     LoopbackServer server(http_answer("201 Created", "Location: http://up/x?id=1\r\n", "ok"));
-    Outcome o;
-    Item item;
-    prepare(item, o, ZV_CURL_HTTP_METHOD_POST, server.url("/feeds/uploads"));
-    zv_curl_set_header(item.p, "X-First: 1");
-    zv_curl_set_header(item.p, "X-Second: 2");
-    zv_curl_set_user_agent(item.p, "zv-test/1.0");
-    zv_curl_set_body(item.p, "<entry/>", 8);
-    exchange(item, o);
+    Item o(ZV_CURL_HTTP_METHOD_POST, server.url("/feeds/uploads"));
+    zv_curl_set_header(o.p, "X-First: 1");
+    zv_curl_set_header(o.p, "X-Second: 2");
+    zv_curl_set_user_agent(o.p, "zv-test/1.0");
+    zv_curl_set_body(o.p, "<entry/>", 8);
+    exchange(o);
 
     std::string raw = server.requests().at(0);
     EXPECT_EQ(raw.rfind("POST /feeds/uploads HTTP/1.1\r\n", 0), 0u) << raw;
@@ -225,10 +221,8 @@ TEST_F(EngineTest, PostSendsHeadersAndBodyAndGetsTheRawAnswer)
                                                     {ZV_CURL_HTTP_METHOD_POST, "POST"}};
     LoopbackServer empty(http_answer("200 OK"));
     for (auto [method, name] : methods) {
-        Outcome o;
-        Item item;
-        prepare(item, o, method, empty.url());
-        exchange(item, o);
+        Item o(method, empty.url());
+        exchange(o);
         std::string raw = empty.requests().back();
         EXPECT_EQ(raw.rfind(std::string(name) + " / HTTP/1.1\r\n", 0), 0u) << raw;
         EXPECT_EQ(raw.find("Transfer-Encoding"), std::string::npos) << raw;
@@ -243,15 +237,13 @@ TEST_F(EngineTest, VerboseLogMasksCredentials)
     if (std::string(getenv("ZV_DLOG_FILE")) != g_log.path())
         GTEST_SKIP() << "the log goes elsewhere";
     LoopbackServer server(http_answer("200 OK", "", "{}"));
-    Outcome o;
-    Item item;
-    prepare(item, o, ZV_CURL_HTTP_METHOD_POST, server.url("/o/oauth2/token"));
-    zv_curl_set_header(item.p, "Authorization: Bearer SECRET-1");
-    zv_curl_set_header(item.p, "X-ZvData-Key: key=SECRET-2");
+    Item o(ZV_CURL_HTTP_METHOD_POST, server.url("/o/oauth2/token"));
+    zv_curl_set_header(o.p, "Authorization: Bearer SECRET-1");
+    zv_curl_set_header(o.p, "X-ZvData-Key: key=SECRET-2");
     const char *form = "client_id=cid&client_secret=SECRET-3&refresh_token=SECRET-4"
                        "&Passwd=SECRET-5&grant_type=refresh_token";
-    zv_curl_set_body(item.p, form, static_cast<int>(strlen(form)));
-    exchange(item, o);
+    zv_curl_set_body(o.p, form, static_cast<int>(strlen(form)));
+    exchange(o);
     EXPECT_NE(server.requests().at(0).find("SECRET-5"), std::string::npos);
     std::string log = zv_test::read_file(g_log.path());
     EXPECT_NE(log.find("POST /o/oauth2/token HTTP/1.1"), std::string::npos);
@@ -287,10 +279,8 @@ TEST_F(EngineTest, PutStreamsTheFileFromItsOffsetFramedByContentLength)
         ASSERT_EQ(pwrite(fd, data.data(), data.size(), c.offset),
                   static_cast<ssize_t>(data.size()));
         close(fd);
-        Outcome o;
-        Item item;
-        prepare_put(item, o, server.url("/up?id=7"), path, c.size, c.offset);
-        exchange(item, o);
+        Item o(server.url("/up?id=7"), path, c.size, c.offset);
+        exchange(o);
 
         std::string raw = server.requests().back();
         size_t head_end = raw.find("\r\n\r\n") + 4;
@@ -321,13 +311,11 @@ TEST_F(EngineTest, PutStreamsTheFileFromItsOffsetFramedByContentLength)
 TEST_F(EngineTest, EmptyPutWithoutFileAsksForTheHeldRange)
 {
     LoopbackServer server(http_answer("308 Resume Incomplete", "Range: bytes=0-4095\r\n"));
-    Outcome o;
-    Item item;
-    prepare(item, o, ZV_CURL_HTTP_METHOD_PUT, server.url("/up?id=7"));
+    Item o(ZV_CURL_HTTP_METHOD_PUT, server.url("/up?id=7"));
     for (const char *line : {"Content-Range: bytes */*",
                              "Accept:", "Transfer-Encoding:", "Expect:", "Content-Length: 0"})
-        zv_curl_set_header(item.p, line);
-    exchange(item, o);
+        zv_curl_set_header(o.p, line);
+    exchange(o);
     std::string raw = server.requests().at(0);
     EXPECT_EQ(raw.rfind("PUT /up?id=7 HTTP/1.1\r\n", 0), 0u);
     EXPECT_TRUE(once(raw, "Content-Length:")) << raw;
@@ -345,13 +333,11 @@ TEST_F(EngineTest, ProxyIsUsedUnlessEmptyOrUnspecifiedAddress)
     const std::pair<std::string, bool> cases[] = {
         {proxy.host(), true}, {"0.0.0.0:8080", false}, {"", false}, {"NULL", false}};
     for (const auto &[proxy_text, via_proxy] : cases) {
-        Outcome o;
-        Item item;
-        prepare(item, o, ZV_CURL_HTTP_METHOD_GET, target.url("/doc"));
-        zv_curl_set_netwrok_info(item.p, "10.0.0.5",
+        Item o(ZV_CURL_HTTP_METHOD_GET, target.url("/doc"));
+        zv_curl_set_netwrok_info(o.p, "10.0.0.5",
                                  proxy_text == "NULL" ? nullptr : proxy_text.c_str());
         size_t through_proxy = proxy.request_count();
-        exchange(item, o);
+        exchange(o);
         EXPECT_EQ(*o.body, via_proxy ? "tunnel" : "direct") << proxy_text;
         if (via_proxy) { // tunnelled through a CONNECT to the target
             auto seen = proxy.requests();
@@ -381,12 +367,10 @@ TEST_F(EngineTest, FailedRequestsCompleteWithStatusZeroAndNoData)
         {"body past the limit (with its NUL)", big_body.url()},
     };
     for (const auto &[what, url] : cases) {
-        Outcome o;
-        Item item;
-        prepare(item, o, ZV_CURL_HTTP_METHOD_POST, url);
-        zv_curl_set_body(item.p, "q=1", 3);
-        zv_curl_set_timeout(item.p, 1000);
-        exchange(item, o);
+        Item o(ZV_CURL_HTTP_METHOD_POST, url);
+        zv_curl_set_body(o.p, "q=1", 3);
+        zv_curl_set_timeout(o.p, 1000);
+        exchange(o);
         EXPECT_EQ(o.call_count(), 1) << what;
         EXPECT_EQ(o.result, ZV_CURL_ERROR_NONE) << what;
         EXPECT_EQ(o.http_code, 0) << what;
@@ -396,10 +380,8 @@ TEST_F(EngineTest, FailedRequestsCompleteWithStatusZeroAndNoData)
 
     // One byte less fits.
     LoopbackServer fits(http_answer("200 OK", "", std::string(ZV_CURL_MAX_RESPONSE_SIZE - 1, 'b')));
-    Outcome o;
-    Item item;
-    prepare(item, o, ZV_CURL_HTTP_METHOD_GET, fits.url());
-    exchange(item, o);
+    Item o(ZV_CURL_HTTP_METHOD_GET, fits.url());
+    exchange(o);
     EXPECT_EQ(o.http_code, 200);
     EXPECT_EQ(o.body.value_or("").size(), ZV_CURL_MAX_RESPONSE_SIZE - 1u);
 }
@@ -433,10 +415,8 @@ TEST_F(EngineTest, ResponseCallbackMayReleaseItsItemButNotCallBackIn)
     EXPECT_EQ(r.cancel_result, ZV_CURL_ERROR_OPERATION_FAILED);
     EXPECT_EQ(r.item->url, nullptr);
     zv_curl_delete(&r.item);
-    Outcome o; // the engine goes on
-    Item item;
-    prepare(item, o, ZV_CURL_HTTP_METHOD_GET, server.url());
-    exchange(item, o);
+    Item o(ZV_CURL_HTTP_METHOD_GET, server.url()); // the engine goes on
+    exchange(o);
 }
 
 // A gated server holds a large upload after its first read; these tests act on it then.
@@ -451,66 +431,61 @@ class RunningUploadTest : public EngineTest
         std::string path = tmp_.file("big.mp4");
         ASSERT_TRUE(zv_test::write_file(path, pattern(kSize)));
         server_.set_gated(true);
-        prepare_put(upload_, o_, server_.url("/up"), path, kSize, 0);
-        ASSERT_EQ(zv_curl_send_request(upload_.p), 0);
-        ASSERT_TRUE(wait_for([this] { return o_.progress_count() > 0; }, kWaitMs));
+        upload_ = std::make_unique<Item>(server_.url("/up"), path, kSize, 0);
+        ASSERT_EQ(zv_curl_send_request(upload_->p), 0);
+        ASSERT_TRUE(wait_for([this] { return upload_->progress_count() > 0; }, kWaitMs));
     }
 
     // Lets the worker run a whole other request: what the held upload would do, it has had
     // the chance to do by then.
     void run_another_request()
     {
-        Outcome other;
-        Item item;
-        prepare(item, other, ZV_CURL_HTTP_METHOD_GET, side_.url());
-        exchange(item, other);
+        Item other(ZV_CURL_HTTP_METHOD_GET, side_.url());
+        exchange(other);
         EXPECT_EQ(other.http_code, 200);
     }
 
     LoopbackServer server_{http_answer("201 Created")};
     LoopbackServer side_{http_answer("200 OK")};
-    Outcome o_;
-    Item upload_;
+    std::unique_ptr<Item> upload_;
 };
 
 TEST_F(RunningUploadTest, PauseHoldsTheRequestAndResumeFinishesItOnTheSameConnection)
 {
-    ASSERT_EQ(zv_curl_pause_request(upload_.p), 0);
-    size_t reads = o_.progress_count();
+    ASSERT_EQ(zv_curl_pause_request(upload_->p), 0);
+    size_t reads = upload_->progress_count();
     server_.set_gated(false);
     run_another_request();
-    EXPECT_EQ(o_.progress_count(), reads);
-    EXPECT_EQ(o_.call_count(), 0);
+    EXPECT_EQ(upload_->progress_count(), reads);
+    EXPECT_EQ(upload_->call_count(), 0);
     EXPECT_LT(server_.body_bytes, kSize);
 
-    ASSERT_EQ(zv_curl_resume_request(upload_.p), 0);
-    ASSERT_TRUE(o_.wait_answer());
-    EXPECT_EQ(o_.http_code, 201);
-    EXPECT_EQ(o_.progress.back(), std::make_pair(100, static_cast<int64_t>(kSize)));
+    ASSERT_EQ(zv_curl_resume_request(upload_->p), 0);
+    ASSERT_TRUE(upload_->wait_answer());
+    EXPECT_EQ(upload_->http_code, 201);
+    EXPECT_EQ(upload_->progress.back(), std::make_pair(100, static_cast<int64_t>(kSize)));
     EXPECT_EQ(server_.body_bytes, kSize);
     EXPECT_EQ(server_.connections, 1);
 }
 
 TEST_F(RunningUploadTest, CancelClosesTheConnectionAndNoAnswerFollows)
 {
-    ASSERT_EQ(zv_curl_cancel_request(upload_.p), 0);
+    ASSERT_EQ(zv_curl_cancel_request(upload_->p), 0);
     server_.set_gated(false);
     EXPECT_TRUE(wait_for([this] { return server_.closed_by_peer > 0; }, kWaitMs));
     run_another_request();
-    EXPECT_EQ(o_.call_count(), 0);
+    EXPECT_EQ(upload_->call_count(), 0);
     EXPECT_LT(server_.body_bytes, kSize);
-    EXPECT_EQ(zv_curl_cancel_request(upload_.p), ZV_CURL_ERROR_INVALID_PARAMETER);
+    EXPECT_EQ(zv_curl_cancel_request(upload_->p), ZV_CURL_ERROR_INVALID_PARAMETER);
 }
 
 TEST_F(RunningUploadTest, StopNeverHangsWithRequestsInFlight)
 {
     LoopbackServer silent(kHang);
-    Outcome hanging;
-    Item query;
-    prepare(query, hanging, ZV_CURL_HTTP_METHOD_GET, silent.url());
-    ASSERT_EQ(zv_curl_send_request(query.p), 0);
+    Item hanging(ZV_CURL_HTTP_METHOD_GET, silent.url());
+    ASSERT_EQ(zv_curl_send_request(hanging.p), 0);
     ASSERT_TRUE(wait_for([&] { return silent.request_count() > 0; }, kWaitMs));
-    ASSERT_EQ(zv_curl_pause_request(upload_.p), 0);
+    ASSERT_EQ(zv_curl_pause_request(upload_->p), 0);
 
     std::atomic<bool> stopped{false};
     std::thread stopper([&] {
@@ -522,7 +497,7 @@ TEST_F(RunningUploadTest, StopNeverHangsWithRequestsInFlight)
         _exit(1);
     }
     stopper.join();
-    EXPECT_EQ(o_.call_count(), 0);
+    EXPECT_EQ(upload_->call_count(), 0);
     EXPECT_EQ(hanging.call_count(), 0);
 
     zv_curl_finalize_service(); // harmless twice; the engine starts again
