@@ -1,204 +1,28 @@
-// Transfer engine against loopback servers written here: what goes on the wire, how answers
-// come back, pause / resume / cancel, failures, stopping with requests in flight, and an
-// open-file limit that cannot hold every transfer.
+// Transfer engine against loopback servers: what goes on the wire, how answers come back,
+// pause / resume / cancel, failures, and stopping with requests in flight.
 #include <gtest/gtest.h>
 
-#include <arpa/inet.h>
-#include <dirent.h>
 #include <fcntl.h>
-#include <netinet/in.h>
-#include <stdlib.h>
 #include <string.h>
-#include <sys/resource.h>
-#include <sys/socket.h>
-#include <unistd.h>
 
-#include <atomic>
-#include <condition_variable>
-#include <functional>
-#include <mutex>
+#include <memory>
 #include <optional>
-#include <string>
-#include <thread>
-#include <vector>
+#include <tuple>
 
 #include "zv-plugin-curl.h"
-#include "zv-test-util.h"
+#include "zv-plugin-test-server.h"
 
 namespace
 {
 
+using namespace zv_plugin_test;
 using zv_test::wait_for;
 constexpr int kWaitMs = 20000;
 
 zv_test::LogFile g_log;
 
-const std::string kReset = "<reset>"; // answer: close the connection with a TCP reset
-const std::string kHang = "<hang>";   // answer: say nothing until the server is destroyed
-
-// A threaded HTTP/1.1 server on 127.0.0.1 (port 0). It records every request as raw bytes
-// (head and up to 1 MiB of body) and answers what the test's responder returns. A CONNECT
-// is accepted as a proxy tunnel whose request is served on the same connection. While gated
-// it reads a request's head but waits with its body.
-class LoopbackServer
-{
-  public:
-    explicit LoopbackServer(std::function<std::string()> responder)
-        : responder_(std::move(responder))
-    {
-        listen_fd_ = zv_test::listen_loopback(&port_, 16);
-        if (listen_fd_ < 0)
-            ADD_FAILURE() << "loopback server: " << strerror(errno);
-        acceptor_ = std::thread([this] {
-            int fd;
-            while ((fd = accept4(listen_fd_, nullptr, nullptr, SOCK_CLOEXEC)) >= 0) {
-                std::lock_guard<std::mutex> lock(m_);
-                if (stop_) {
-                    close(fd);
-                    break;
-                }
-                ++connections_;
-                conn_fds_.push_back(fd);
-                workers_.emplace_back([this, fd] { serve(fd); });
-            }
-        });
-    }
-    ~LoopbackServer()
-    {
-        {
-            std::lock_guard<std::mutex> lock(m_);
-            stop_ = true;
-            for (int fd : conn_fds_)
-                shutdown(fd, SHUT_RDWR);
-        }
-        shutdown(listen_fd_, SHUT_RDWR); // ends the blocked accept
-        cv_.notify_all();
-        acceptor_.join();
-        for (std::thread &t : workers_)
-            t.join();
-        close(listen_fd_);
-    }
-
-    int port() const { return port_; }
-    std::string url(const std::string &path = "/") const
-    {
-        return "http://127.0.0.1:" + std::to_string(port_) + path;
-    }
-    void set_gated(bool gated)
-    {
-        std::lock_guard<std::mutex> lock(m_);
-        gated_ = gated;
-        cv_.notify_all();
-    }
-    std::vector<std::string> requests()
-    {
-        std::lock_guard<std::mutex> lock(m_);
-        return requests_;
-    }
-    size_t request_count() { return requests().size(); }
-    std::atomic<long long> body_bytes{0};
-    std::atomic<int> connections_{0};
-    std::atomic<int> closed_by_peer{0};
-
-  private:
-    bool more(int fd, std::string &buf)
-    {
-        char tmp[65536];
-        ssize_t n = recv(fd, tmp, sizeof tmp, 0);
-        if (n == 0)
-            ++closed_by_peer;
-        if (n <= 0)
-            return false;
-        buf.append(tmp, static_cast<size_t>(n));
-        return true;
-    }
-
-    bool read_head(int fd, std::string &buf, std::string &head)
-    {
-        size_t end;
-        while ((end = buf.find("\r\n\r\n")) == std::string::npos) {
-            if (!more(fd, buf))
-                return false;
-        }
-        head = buf.substr(0, end + 4);
-        buf.erase(0, end + 4);
-        return true;
-    }
-
-    void serve(int fd)
-    {
-        const size_t kKeep = 1 << 20;
-        std::string buf, head;
-        while (read_head(fd, buf, head)) {
-            if (head.rfind("CONNECT ", 0) == 0) {
-                record(head);
-                send(fd, "HTTP/1.1 200 OK\r\n\r\n", 19, MSG_NOSIGNAL);
-                continue;
-            }
-            {
-                std::unique_lock<std::mutex> lock(m_);
-                cv_.wait(lock, [this] { return !gated_ || stop_; });
-            }
-            size_t at = head.find("\r\nContent-Length: ");
-            long long left = at == std::string::npos ? 0 : atoll(head.c_str() + at + 18);
-            std::string kept;
-            while (left > 0 && (!buf.empty() || more(fd, buf))) {
-                size_t take = static_cast<size_t>(std::min<long long>(left, buf.size()));
-                kept.append(buf, 0, std::min(take, kKeep - std::min(kept.size(), kKeep)));
-                buf.erase(0, take);
-                left -= static_cast<long long>(take);
-                body_bytes += static_cast<long long>(take);
-            }
-            record(head + kept);
-            std::string answer = responder_();
-            if (answer == kReset) {
-                linger lg{1, 0};
-                setsockopt(fd, SOL_SOCKET, SO_LINGER, &lg, sizeof lg);
-                break;
-            }
-            if (answer == kHang) {
-                std::unique_lock<std::mutex> lock(m_);
-                cv_.wait(lock, [this] { return stop_; });
-                break;
-            }
-            for (size_t sent = 0; sent < answer.size();) {
-                ssize_t n = send(fd, answer.data() + sent, answer.size() - sent, MSG_NOSIGNAL);
-                if (n <= 0)
-                    break;
-                sent += static_cast<size_t>(n);
-            }
-        }
-        close(fd);
-    }
-
-    void record(const std::string &raw)
-    {
-        std::lock_guard<std::mutex> lock(m_);
-        requests_.push_back(raw);
-    }
-
-    std::function<std::string()> responder_;
-    int listen_fd_ = -1;
-    int port_ = 0;
-    std::thread acceptor_;
-    std::mutex m_;
-    std::condition_variable cv_;
-    bool stop_ = false;
-    bool gated_ = false;
-    std::vector<int> conn_fds_;
-    std::vector<std::thread> workers_;
-    std::vector<std::string> requests_;
-};
-
-std::function<std::string()> answer(const std::string &status, const std::string &headers = "",
-                                    const std::string &body = "")
-{
-    std::string text = "HTTP/1.1 " + status + "\r\n" + headers +
-                       "Content-Length: " + std::to_string(body.size()) + "\r\n\r\n" + body;
-    return [text] { return text; };
-}
-
-// What came back for one item, copied on the worker.
+// What came back for one item, copied on the worker. Once an answer is seen (through the
+// lock), the worker writes nothing more and the fields are read directly.
 struct Outcome {
     std::mutex m;
     int calls = 0;
@@ -243,38 +67,30 @@ void on_progress(int percent, void *user_data, int64_t, int64_t file_offset)
     o->progress.emplace_back(percent, file_offset);
 }
 
-// An item record, deleted through the engine when the test ends.
-struct Item {
+// An item record with what came back for it, deleted through the engine when the test ends.
+struct Item : Outcome {
     TransferItem *p = nullptr;
     Item() { zv_curl_new(&p); }
+    Item(int method, const std::string &url) : Item()
+    {
+        zv_curl_set_callback_func(p, on_response);
+        zv_curl_set_progress_cb_func(p, on_progress);
+        zv_curl_set_user_data(p, static_cast<Outcome *>(this));
+        zv_curl_set_method(p, method);
+        zv_curl_set_url(p, url.c_str());
+        zv_curl_set_timeout(p, 60000);
+        zv_curl_set_connect_timeout(p, 30000);
+    }
+    // A PUT of `path` from `offset`, framed as a data upload is.
+    Item(const std::string &url, const std::string &path, int64_t size, int64_t offset)
+        : Item(ZV_CURL_HTTP_METHOD_PUT, url)
+    {
+        zv_curl_set_header(p, ("Content-Length: " + std::to_string(size - offset)).c_str());
+        EXPECT_EQ(zv_curl_set_file_info(p, path.c_str(), size, offset), 0);
+    }
     ~Item() { zv_curl_delete(&p); }
     TransferItem *operator->() { return p; }
 };
-
-void prepare(Item &item, Outcome &o, int method, const std::string &url)
-{
-    zv_curl_set_callback_func(item.p, on_response);
-    zv_curl_set_progress_cb_func(item.p, on_progress);
-    zv_curl_set_user_data(item.p, &o);
-    zv_curl_set_method(item.p, method);
-    zv_curl_set_url(item.p, url.c_str());
-    zv_curl_set_timeout(item.p, 60000);
-    zv_curl_set_connect_timeout(item.p, 30000);
-}
-
-// A PUT of `path` from `offset` with the headers of a data upload.
-void prepare_put(Item &item, Outcome &o, const std::string &url, const std::string &path,
-                 int64_t size, int64_t offset)
-{
-    prepare(item, o, ZV_CURL_HTTP_METHOD_PUT, url);
-    std::string range = "Content-Range: bytes " + std::to_string(offset) + "-" +
-                        std::to_string(size - 1) + "/" + std::to_string(size);
-    std::string length = "Content-Length: " + std::to_string(size - offset);
-    zv_curl_set_header(item.p, "Content-Type: video/mp4");
-    zv_curl_set_header(item.p, range.c_str());
-    zv_curl_set_header(item.p, length.c_str());
-    ASSERT_EQ(zv_curl_set_file_info(item.p, path.c_str(), size, offset), 0);
-}
 
 std::string pattern(size_t size)
 {
@@ -284,12 +100,10 @@ std::string pattern(size_t size)
     return data;
 }
 
-int count_of(const std::string &text, const std::string &needle)
+bool once(const std::string &text, const std::string &needle)
 {
-    int n = 0;
-    for (size_t at = text.find(needle); at != std::string::npos; at = text.find(needle, at + 1))
-        ++n;
-    return n;
+    size_t at = text.find(needle);
+    return at != std::string::npos && at == text.rfind(needle);
 }
 
 class EngineTest : public ::testing::Test
@@ -304,9 +118,9 @@ class EngineTest : public ::testing::Test
     void TearDown() override { zv_curl_finalize_service(); }
 
     // Sends a prepared item and waits for its answer.
-    void exchange(Item &item, Outcome &o)
+    void exchange(Item &o)
     {
-        ASSERT_EQ(zv_curl_send_request(item.p), 0);
+        ASSERT_EQ(zv_curl_send_request(o.p), 0);
         ASSERT_TRUE(o.wait_answer());
     }
 
@@ -348,9 +162,9 @@ TEST(EngineItem, SettersRefuseBadValuesAndChangeNothing)
     EXPECT_EQ(zv_curl_set_body(item.p, nullptr, 0), 0);
     EXPECT_EQ(zv_curl_set_timeout(item.p, 0), 0);
     EXPECT_EQ(zv_curl_set_file_info(item.p, "/g", 0, 0), 0);
+    std::vector<std::string> lines;
     for (const char *line : {"A: 1", "B: 2", "C:"})
         zv_curl_set_header(item.p, line);
-    std::vector<std::string> lines;
     for (GList *l = item->header_list; l; l = l->next)
         lines.push_back(static_cast<char *>(l->data));
     EXPECT_EQ(lines, (std::vector<std::string>{"A: 1", "B: 2", "C:"}));
@@ -363,252 +177,8 @@ TEST(EngineItem, SettersRefuseBadValuesAndChangeNothing)
     EXPECT_EQ(zv_curl_new(&item.p), 0);
     EXPECT_NE(item.p, nullptr);
     EXPECT_EQ(zv_curl_new(nullptr), ZV_CURL_ERROR_INVALID_HANDLE);
-}
 
-TEST_F(EngineTest, PostSendsHeadersAndBodyAndGetsTheRawAnswer)
-{
-    LoopbackServer server(answer("201 Created", "Location: http://up/x?id=1\r\n", "ok"));
-    Outcome o;
-    Item item;
-    prepare(item, o, ZV_CURL_HTTP_METHOD_POST, server.url("/feeds/uploads"));
-    zv_curl_set_header(item.p, "X-First: 1");
-    zv_curl_set_header(item.p, "X-Second: 2");
-    zv_curl_set_user_agent(item.p, "zv-test/1.0");
-    zv_curl_set_body(item.p, "<entry/>", 8);
-    exchange(item, o);
-
-    std::string raw = server.requests().at(0);
-    EXPECT_EQ(raw.rfind("POST /feeds/uploads HTTP/1.1\r\n", 0), 0u) << raw;
-    EXPECT_NE(raw.find("\r\nUser-Agent: zv-test/1.0\r\n"), std::string::npos);
-    EXPECT_NE(raw.find("\r\nContent-Length: 8\r\n"), std::string::npos);
-    EXPECT_LT(raw.find("X-First: 1"), raw.find("X-Second: 2"));
-    EXPECT_EQ(raw.substr(raw.size() - 12), "\r\n\r\n<entry/>");
-    std::lock_guard<std::mutex> lock(o.m);
-    EXPECT_EQ(o.calls, 1);
-    EXPECT_EQ(o.result, ZV_CURL_ERROR_NONE);
-    EXPECT_EQ(o.http_code, 201);
-    EXPECT_EQ(*o.header,
-              "HTTP/1.1 201 Created\r\nLocation: http://up/x?id=1\r\nContent-Length: 2\r\n\r\n");
-    EXPECT_EQ(*o.body, "ok");
-}
-
-TEST_F(EngineTest, VerboseLogMasksCredentials)
-{
-    if (std::string(getenv("ZV_DLOG_FILE")) != g_log.path())
-        GTEST_SKIP() << "the log goes elsewhere";
-    LoopbackServer server(answer("200 OK", "", "{}"));
-    Outcome o;
-    Item item;
-    prepare(item, o, ZV_CURL_HTTP_METHOD_POST, server.url("/o/oauth2/token"));
-    zv_curl_set_header(item.p, "Authorization: Bearer SECRET-1");
-    zv_curl_set_header(item.p, "X-ZvData-Key: key=SECRET-2");
-    const char *form = "client_id=cid&client_secret=SECRET-3&refresh_token=SECRET-4"
-                       "&Passwd=SECRET-5&grant_type=refresh_token";
-    zv_curl_set_body(item.p, form, static_cast<int>(strlen(form)));
-    exchange(item, o);
-    EXPECT_NE(server.requests().at(0).find("SECRET-5"), std::string::npos);
-    std::string log = zv_test::read_file(g_log.path());
-    EXPECT_NE(log.find("POST /o/oauth2/token HTTP/1.1"), std::string::npos);
-    EXPECT_NE(log.find("Authorization: ****"), std::string::npos);
-    EXPECT_NE(log.find("X-ZvData-Key: ****"), std::string::npos);
-    EXPECT_NE(log.find("client_id=cid&client_secret=****&refresh_token=****&Passwd=****"
-                       "&grant_type=refresh_token"),
-              std::string::npos);
-    EXPECT_EQ(log.find("SECRET-"), std::string::npos);
-}
-
-TEST_F(EngineTest, MethodValuesChooseTheRequestLine)
-{
-    LoopbackServer server(answer("200 OK"));
-    const std::pair<int, const char *> cases[] = {
-        {ZV_CURL_HTTP_METHOD_GET, "GET"},
-        {5, "GET"}, // any value but 1 and 2
-        {-1, "GET"},
-        {ZV_CURL_HTTP_METHOD_POST, "POST"}, // without body: an empty one
-    };
-    for (auto [method, name] : cases) {
-        Outcome o;
-        Item item;
-        prepare(item, o, method, server.url());
-        exchange(item, o);
-        std::string raw = server.requests().back();
-        EXPECT_EQ(raw.rfind(std::string(name) + " / HTTP/1.1\r\n", 0), 0u) << raw;
-        EXPECT_EQ(raw.find("Transfer-Encoding"), std::string::npos) << raw;
-        std::lock_guard<std::mutex> lock(o.m);
-        EXPECT_EQ(o.http_code, 200);
-        EXPECT_FALSE(o.body.has_value()); // no body: NULL, and the whole header block
-        EXPECT_EQ(*o.header, "HTTP/1.1 200 OK\r\nContent-Length: 0\r\n\r\n");
-    }
-}
-
-TEST_F(EngineTest, PutStreamsTheFileFromItsOffsetFramedByContentLength)
-{
-    LoopbackServer server(answer("201 Created", "ETag: \"v1\"\r\n"));
-    // size, offset, bytes the file grew by after its size was taken (never sent)
-    const std::tuple<int64_t, int64_t, int64_t> cases[] = {
-        {1000, 400, 0}, {3 * 1024 * 1024 + 17, 0, 0}, {0, 0, 0}, {600, 100, 5000}};
-    for (auto [size, offset, grown] : cases) {
-        std::string data = pattern(static_cast<size_t>(size + grown));
-        std::string path = tmp_.file("clip-" + std::to_string(size) + ".mp4");
-        ASSERT_TRUE(zv_test::write_file(path, data));
-        Outcome o;
-        Item item;
-        prepare_put(item, o, server.url("/up?id=7"), path, size, offset);
-        exchange(item, o);
-
-        std::string raw = server.requests().back();
-        size_t head_end = raw.find("\r\n\r\n") + 4;
-        std::string head = raw.substr(0, head_end);
-        std::string sent = data.substr(static_cast<size_t>(offset), size - offset);
-        EXPECT_EQ(head.rfind("PUT /up?id=7 HTTP/1.1\r\n", 0), 0u) << head;
-        EXPECT_EQ(count_of(head, "Content-Length:"), 1) << head;
-        EXPECT_NE(head.find("Content-Length: " + std::to_string(sent.size())), std::string::npos);
-        EXPECT_EQ(head.find("Expect"), std::string::npos) << head;
-        EXPECT_EQ(head.find("Transfer-Encoding"), std::string::npos) << head;
-        EXPECT_EQ(raw.substr(head_end), sent.substr(0, 1u << 20));
-
-        std::lock_guard<std::mutex> lock(o.m);
-        EXPECT_EQ(o.http_code, 201);
-        for (auto [percent, at] : o.progress) // a file of size 0 reports 100
-            EXPECT_EQ(percent, size ? static_cast<int>(100.0 * at / size) : 100) << size;
-        if (size > 0) {
-            ASSERT_FALSE(o.progress.empty());
-            EXPECT_EQ(o.progress.back(), std::make_pair(100, size));
-        }
-        if (size == 1000) { // the first read takes all 600 bytes, the final one none
-            EXPECT_EQ(o.progress, (decltype(o.progress){{100, 1000}, {100, 1000}}));
-        }
-    }
-}
-
-TEST_F(EngineTest, PutPastFourGiBCountsOffsetsAndPercentInSixtyFourBits)
-{
-    // The last MiB of a sparse 5 GiB file: every offset is past the 32-bit limits.
-    LoopbackServer server(answer("201 Created"));
-    const int64_t size = 5LL << 30, offset = size - (1 << 20);
-    const std::string tail = pattern(1 << 20);
-    const std::string path = tmp_.file("big.mp4");
-    int fd = open(path.c_str(), O_CREAT | O_WRONLY, 0600);
-    ASSERT_GE(fd, 0);
-    ASSERT_EQ(pwrite(fd, tail.data(), tail.size(), offset), static_cast<ssize_t>(tail.size()));
-    close(fd);
-    Outcome o;
-    Item item;
-    prepare_put(item, o, server.url("/up"), path, size, offset);
-    exchange(item, o);
-
-    std::string raw = server.requests().back();
-    size_t head_end = raw.find("\r\n\r\n") + 4;
-    EXPECT_NE(raw.find("Content-Range: bytes 5367660544-5368709119/5368709120"), std::string::npos);
-    EXPECT_EQ(raw.substr(head_end), tail);
-    std::lock_guard<std::mutex> lock(o.m);
-    ASSERT_FALSE(o.progress.empty());
-    int64_t last = offset;
-    for (auto [percent, at] : o.progress) {
-        EXPECT_GE(at, last);
-        EXPECT_EQ(percent, static_cast<int>(100.0 * at / size));
-        last = at;
-    }
-    EXPECT_EQ(o.progress.front().first, 99);
-    EXPECT_EQ(o.progress.back(), std::make_pair(100, size));
-}
-
-TEST_F(EngineTest, EmptyPutWithoutFileAsksForTheHeldRange)
-{
-    LoopbackServer server(answer("308 Resume Incomplete", "Range: bytes=0-4095\r\n"));
-    Outcome o;
-    Item item;
-    prepare(item, o, ZV_CURL_HTTP_METHOD_PUT, server.url("/up?id=7"));
-    for (const char *line : {"Content-Range: bytes */*",
-                             "Accept:", "Transfer-Encoding:", "Expect:", "Content-Length: 0"})
-        zv_curl_set_header(item.p, line);
-    exchange(item, o);
-    std::string raw = server.requests().at(0);
-    EXPECT_EQ(raw.rfind("PUT /up?id=7 HTTP/1.1\r\n", 0), 0u);
-    EXPECT_EQ(count_of(raw, "Content-Length:"), 1) << raw;
-    for (const char *absent : {"Accept:", "Expect:", "Transfer-Encoding:"})
-        EXPECT_EQ(raw.find(absent), std::string::npos) << absent;
-    EXPECT_EQ(raw.substr(raw.size() - 4), "\r\n\r\n"); // no body
-    std::lock_guard<std::mutex> lock(o.m);
-    EXPECT_EQ(o.http_code, 308);
-    EXPECT_NE(o.header->find("Range: bytes=0-4095\r\n"), std::string::npos);
-}
-
-TEST_F(EngineTest, ProxyIsUsedUnlessEmptyOrUnspecifiedAddress)
-{
-    LoopbackServer target(answer("200 OK", "", "direct"));
-    LoopbackServer proxy(answer("200 OK", "", "tunnel"));
-    std::string proxy_addr = "127.0.0.1:" + std::to_string(proxy.port());
-    const std::pair<const char *, bool> cases[] = {
-        {proxy_addr.c_str(), true}, {"0.0.0.0:8080", false}, {"", false}, {nullptr, false}};
-    for (auto [proxy_text, via_proxy] : cases) {
-        Outcome o;
-        Item item;
-        prepare(item, o, ZV_CURL_HTTP_METHOD_GET, target.url("/doc"));
-        zv_curl_set_netwrok_info(item.p, "10.0.0.5", proxy_text);
-        size_t through_proxy = proxy.request_count();
-        exchange(item, o);
-        std::lock_guard<std::mutex> lock(o.m);
-        EXPECT_EQ(*o.body, via_proxy ? "tunnel" : "direct") << (proxy_text ? proxy_text : "NULL");
-        if (via_proxy) { // tunnelled through a CONNECT to the target
-            auto seen = proxy.requests();
-            ASSERT_EQ(seen.size(), through_proxy + 2);
-            std::string connect = "CONNECT 127.0.0.1:" + std::to_string(target.port());
-            EXPECT_EQ(seen[through_proxy].rfind(connect, 0), 0u) << seen[through_proxy];
-            EXPECT_EQ(seen[through_proxy + 1].rfind("GET /doc HTTP/1.1", 0), 0u);
-        }
-    }
-    EXPECT_EQ(target.request_count(), 3u);
-}
-
-// A request without a whole answer is reported once, as no answer: status 0, no data.
-TEST_F(EngineTest, FailedRequestsCompleteWithStatusZeroAndNoData)
-{
-    int closed_port = LoopbackServer(answer("200 OK")).port();
-    LoopbackServer reset([] { return kReset; });
-    LoopbackServer silent([] { return kHang; });
-    LoopbackServer big_head([] {
-        std::string head = "HTTP/1.1 200 OK\r\n";
-        while (head.size() < ZV_CURL_MAX_RESPONSE_SIZE + 4096)
-            head += "X-Pad: " + std::string(1000, 'p') + "\r\n";
-        return head + "Content-Length: 0\r\n\r\n";
-    });
-    LoopbackServer big_body(answer("200 OK", "", std::string(ZV_CURL_MAX_RESPONSE_SIZE, 'b')));
-    const std::pair<const char *, std::string> cases[] = {
-        {"closed port", "http://127.0.0.1:" + std::to_string(closed_port) + "/"},
-        {"reset", reset.url()},
-        {"time-out", silent.url()},
-        {"header block past the limit", big_head.url()},
-        {"body past the limit (with its NUL)", big_body.url()},
-    };
-    for (const auto &[what, url] : cases) {
-        Outcome o;
-        Item item;
-        prepare(item, o, ZV_CURL_HTTP_METHOD_POST, url);
-        zv_curl_set_body(item.p, "q=1", 3);
-        zv_curl_set_timeout(item.p, 1000);
-        exchange(item, o);
-        std::lock_guard<std::mutex> lock(o.m);
-        EXPECT_EQ(o.calls, 1) << what;
-        EXPECT_EQ(o.result, ZV_CURL_ERROR_NONE) << what;
-        EXPECT_EQ(o.http_code, 0) << what;
-        EXPECT_FALSE(o.header.has_value()) << what;
-        EXPECT_FALSE(o.body.has_value()) << what;
-    }
-
-    // One byte less fits.
-    LoopbackServer fits(answer("200 OK", "", std::string(ZV_CURL_MAX_RESPONSE_SIZE - 1, 'b')));
-    Outcome o;
-    Item item;
-    prepare(item, o, ZV_CURL_HTTP_METHOD_GET, fits.url());
-    exchange(item, o);
-    std::lock_guard<std::mutex> lock(o.m);
-    EXPECT_EQ(o.http_code, 200);
-    EXPECT_EQ(o.body.value_or("").size(), ZV_CURL_MAX_RESPONSE_SIZE - 1u);
-}
-
-TEST_F(EngineTest, CancelPauseResumeCheckTheirItem)
-{
+    // Cancel, pause and resume need an item that was sent; send needs a URL.
     Item never_sent, no_url;
     zv_curl_set_url(never_sent.p, "http://127.0.0.1:1/");
     for (auto op : {zv_curl_cancel_request, zv_curl_pause_request, zv_curl_resume_request}) {
@@ -620,6 +190,202 @@ TEST_F(EngineTest, CancelPauseResumeCheckTheirItem)
     EXPECT_EQ(zv_curl_send_request(no_url.p), ZV_CURL_ERROR_INVALID_PARAMETER);
 }
 
+TEST_F(EngineTest, PostSendsHeadersAndBodyAndGetsTheRawAnswer)
+{
+    LoopbackServer server(http_answer("201 Created", "Location: http://up/x?id=1\r\n", "ok"));
+    Item o(ZV_CURL_HTTP_METHOD_POST, server.url("/feeds/uploads"));
+    zv_curl_set_header(o.p, "X-First: 1");
+    zv_curl_set_header(o.p, "X-Second: 2");
+    zv_curl_set_user_agent(o.p, "zv-test/1.0");
+    zv_curl_set_body(o.p, "<entry/>", 8);
+    exchange(o);
+
+    std::string raw = server.requests().at(0);
+    EXPECT_EQ(raw.rfind("POST /feeds/uploads HTTP/1.1\r\n", 0), 0u) << raw;
+    EXPECT_NE(raw.find("\r\nUser-Agent: zv-test/1.0\r\n"), std::string::npos);
+    EXPECT_NE(raw.find("\r\nContent-Length: 8\r\n"), std::string::npos);
+    EXPECT_LT(raw.find("X-First: 1"), raw.find("X-Second: 2"));
+    EXPECT_EQ(raw.substr(raw.size() - 12), "\r\n\r\n<entry/>");
+    EXPECT_EQ(o.calls, 1);
+    EXPECT_EQ(o.result, ZV_CURL_ERROR_NONE);
+    EXPECT_EQ(o.http_code, 201);
+    EXPECT_EQ(*o.header,
+              "HTTP/1.1 201 Created\r\nLocation: http://up/x?id=1\r\nContent-Length: 2\r\n\r\n");
+    EXPECT_EQ(*o.body, "ok");
+
+    // Any method value but PUT and POST is a GET; a POST without body sends an empty one. An
+    // answer without body is NULL beside its whole header block.
+    const std::pair<int, const char *> methods[] = {{ZV_CURL_HTTP_METHOD_GET, "GET"},
+                                                    {5, "GET"},
+                                                    {-1, "GET"},
+                                                    {ZV_CURL_HTTP_METHOD_POST, "POST"}};
+    LoopbackServer empty(http_answer("200 OK"));
+    for (auto [method, name] : methods) {
+        Item o(method, empty.url());
+        exchange(o);
+        std::string raw = empty.requests().back();
+        EXPECT_EQ(raw.rfind(std::string(name) + " / HTTP/1.1\r\n", 0), 0u) << raw;
+        EXPECT_EQ(raw.find("Transfer-Encoding"), std::string::npos) << raw;
+        EXPECT_EQ(o.http_code, 200);
+        EXPECT_FALSE(o.body.has_value());
+        EXPECT_EQ(*o.header, "HTTP/1.1 200 OK\r\nContent-Length: 0\r\n\r\n");
+    }
+}
+
+TEST_F(EngineTest, VerboseLogMasksCredentials)
+{
+    if (std::string(getenv("ZV_DLOG_FILE")) != g_log.path())
+        GTEST_SKIP() << "the log goes elsewhere";
+    LoopbackServer server(http_answer("200 OK", "", "{}"));
+    Item o(ZV_CURL_HTTP_METHOD_POST, server.url("/o/oauth2/token"));
+    zv_curl_set_header(o.p, "Authorization: Bearer SECRET-1");
+    zv_curl_set_header(o.p, "X-ZvData-Key: key=SECRET-2");
+    const char *form = "client_id=cid&client_secret=SECRET-3&refresh_token=SECRET-4"
+                       "&Passwd=SECRET-5&grant_type=refresh_token";
+    zv_curl_set_body(o.p, form, static_cast<int>(strlen(form)));
+    exchange(o);
+    EXPECT_NE(server.requests().at(0).find("SECRET-5"), std::string::npos);
+    std::string log = zv_test::read_file(g_log.path());
+    EXPECT_NE(log.find("POST /o/oauth2/token HTTP/1.1"), std::string::npos);
+    EXPECT_NE(log.find("Authorization: ****"), std::string::npos);
+    EXPECT_NE(log.find("X-ZvData-Key: ****"), std::string::npos);
+    EXPECT_NE(log.find("client_id=cid&client_secret=****&refresh_token=****&Passwd=****"
+                       "&grant_type=refresh_token"),
+              std::string::npos);
+    EXPECT_EQ(log.find("SECRET-"), std::string::npos);
+}
+
+// The file is written from the offset on (sparse before it); bytes it grew by after its size
+// was taken are never sent. The percent is that of the file's offset after each read.
+TEST_F(EngineTest, PutStreamsTheFileFromItsOffsetFramedByContentLength)
+{
+    LoopbackServer server(http_answer("201 Created", "ETag: \"v1\"\r\n"));
+    struct Case {
+        int64_t size, offset, grown;
+        int first_percent; // -1: left to the read sizes
+    };
+    const Case cases[] = {
+        {1000, 400, 0, 100}, // one read takes all 600 bytes
+        {3 * 1024 * 1024 + 17, 0, 0, -1},
+        {0, 0, 0, 100}, // an empty file is done, and never divides by zero
+        {600, 100, 5000, 100},
+        {5LL << 30, (5LL << 30) - (1 << 20), 0, 99}, // offsets past the 32-bit limits
+    };
+    for (const Case &c : cases) {
+        SCOPED_TRACE(c.size);
+        const std::string path = tmp_.file("clip.mp4"), data = pattern(c.size - c.offset + c.grown);
+        int fd = open(path.c_str(), O_CREAT | O_TRUNC | O_WRONLY, 0600);
+        ASSERT_GE(fd, 0);
+        ASSERT_EQ(pwrite(fd, data.data(), data.size(), c.offset),
+                  static_cast<ssize_t>(data.size()));
+        close(fd);
+        Item o(server.url("/up?id=7"), path, c.size, c.offset);
+        exchange(o);
+
+        std::string raw = server.requests().back();
+        size_t head_end = raw.find("\r\n\r\n") + 4;
+        std::string head = raw.substr(0, head_end);
+        EXPECT_EQ(head.rfind("PUT /up?id=7 HTTP/1.1\r\n", 0), 0u) << head;
+        EXPECT_TRUE(once(head, "Content-Length: " + std::to_string(c.size - c.offset) + "\r\n"))
+            << head;
+        EXPECT_TRUE(once(head, "Content-Length:")) << head;
+        EXPECT_EQ(head.find("Expect"), std::string::npos) << head;
+        EXPECT_EQ(head.find("Transfer-Encoding"), std::string::npos) << head;
+        EXPECT_EQ(raw.substr(head_end),
+                  data.substr(0, std::min<int64_t>(c.size - c.offset, 1 << 20)));
+
+        EXPECT_EQ(o.http_code, 201);
+        ASSERT_FALSE(o.progress.empty());
+        if (c.first_percent >= 0) {
+            EXPECT_EQ(o.progress.front().first, c.first_percent);
+        }
+        for (size_t i = 1; i < o.progress.size(); ++i)
+            EXPECT_LE(o.progress[i - 1], o.progress[i]);
+        EXPECT_EQ(o.progress.back(), std::make_pair(100, c.size));
+        if (c.size == 1000) { // the final read gets none
+            EXPECT_EQ(o.progress, (decltype(o.progress){{100, 1000}, {100, 1000}}));
+        }
+    }
+}
+
+TEST_F(EngineTest, EmptyPutWithoutFileAsksForTheHeldRange)
+{
+    LoopbackServer server(http_answer("308 Resume Incomplete", "Range: bytes=0-4095\r\n"));
+    Item o(ZV_CURL_HTTP_METHOD_PUT, server.url("/up?id=7"));
+    for (const char *line : {"Content-Range: bytes */*",
+                             "Accept:", "Transfer-Encoding:", "Expect:", "Content-Length: 0"})
+        zv_curl_set_header(o.p, line);
+    exchange(o);
+    std::string raw = server.requests().at(0);
+    EXPECT_EQ(raw.rfind("PUT /up?id=7 HTTP/1.1\r\n", 0), 0u);
+    EXPECT_TRUE(once(raw, "Content-Length:")) << raw;
+    for (const char *absent : {"Accept:", "Expect:", "Transfer-Encoding:"})
+        EXPECT_EQ(raw.find(absent), std::string::npos) << absent;
+    EXPECT_EQ(raw.substr(raw.size() - 4), "\r\n\r\n"); // no body
+    EXPECT_EQ(o.http_code, 308);
+    EXPECT_NE(o.header->find("Range: bytes=0-4095\r\n"), std::string::npos);
+}
+
+TEST_F(EngineTest, ProxyIsUsedUnlessEmptyOrUnspecifiedAddress)
+{
+    LoopbackServer target(http_answer("200 OK", "", "direct"));
+    LoopbackServer proxy(http_answer("200 OK", "", "tunnel"));
+    const std::pair<std::string, bool> cases[] = {
+        {proxy.host(), true}, {"0.0.0.0:8080", false}, {"", false}, {"NULL", false}};
+    for (const auto &[proxy_text, via_proxy] : cases) {
+        Item o(ZV_CURL_HTTP_METHOD_GET, target.url("/doc"));
+        zv_curl_set_netwrok_info(o.p, "10.0.0.5",
+                                 proxy_text == "NULL" ? nullptr : proxy_text.c_str());
+        size_t through_proxy = proxy.request_count();
+        exchange(o);
+        EXPECT_EQ(*o.body, via_proxy ? "tunnel" : "direct") << proxy_text;
+        if (via_proxy) { // tunnelled through a CONNECT to the target
+            auto seen = proxy.requests();
+            ASSERT_EQ(seen.size(), through_proxy + 2);
+            EXPECT_EQ(seen[through_proxy].rfind("CONNECT " + target.host(), 0), 0u);
+            EXPECT_EQ(seen[through_proxy + 1].rfind("GET /doc HTTP/1.1", 0), 0u);
+        }
+    }
+    EXPECT_EQ(target.request_count(), 3u);
+}
+
+// A request without a whole answer is reported once, as no answer: status 0, no data.
+TEST_F(EngineTest, FailedRequestsCompleteWithStatusZeroAndNoData)
+{
+    int closed_port = LoopbackServer(http_answer("200 OK")).port();
+    LoopbackServer reset(kReset), silent(kHang);
+    std::string head = "HTTP/1.1 200 OK\r\n";
+    while (head.size() < ZV_CURL_MAX_RESPONSE_SIZE + 4096)
+        head += "X-Pad: " + std::string(1000, 'p') + "\r\n";
+    LoopbackServer big_head(head + "Content-Length: 0\r\n\r\n");
+    LoopbackServer big_body(http_answer("200 OK", "", std::string(ZV_CURL_MAX_RESPONSE_SIZE, 'b')));
+    const std::pair<const char *, std::string> cases[] = {
+        {"closed port", "http://127.0.0.1:" + std::to_string(closed_port) + "/"},
+        {"reset", reset.url()},
+        {"time-out", silent.url()},
+        {"header block past the limit", big_head.url()},
+        {"body past the limit (with its NUL)", big_body.url()},
+    };
+    for (const auto &[what, url] : cases) {
+        Item o(ZV_CURL_HTTP_METHOD_POST, url);
+        zv_curl_set_body(o.p, "q=1", 3);
+        zv_curl_set_timeout(o.p, 1000);
+        exchange(o);
+        EXPECT_EQ(o.call_count(), 1) << what;
+        EXPECT_EQ(o.result, ZV_CURL_ERROR_NONE) << what;
+        EXPECT_EQ(o.http_code, 0) << what;
+        EXPECT_FALSE(o.header.has_value()) << what;
+        EXPECT_FALSE(o.body.has_value()) << what;
+    }
+
+    // One byte less fits.
+    LoopbackServer fits(http_answer("200 OK", "", std::string(ZV_CURL_MAX_RESPONSE_SIZE - 1, 'b')));
+    Item o(ZV_CURL_HTTP_METHOD_GET, fits.url());
+    exchange(o);
+    EXPECT_EQ(o.http_code, 200);
+    EXPECT_EQ(o.body.value_or("").size(), ZV_CURL_MAX_RESPONSE_SIZE - 1u);
+}
+
 // From a response callback (worker thread, lock held) the calls that would deadlock are
 // refused, and emptying or replacing the item is safe.
 struct Reentry {
@@ -628,22 +394,19 @@ struct Reentry {
     TransferItem *item = nullptr;
 };
 
-void reentrant_response(int, TransferResponse *, void *user_data)
-{
-    Reentry *r = static_cast<Reentry *>(user_data);
-    r->send_result = zv_curl_send_request(r->item);
-    r->cancel_result = zv_curl_cancel_request(r->item);
-    zv_curl_free(r->item);
-    zv_curl_new(&r->item); // the old record is reclaimed after this report
-    r->done = true;
-}
-
 TEST_F(EngineTest, ResponseCallbackMayReleaseItsItemButNotCallBackIn)
 {
-    LoopbackServer server(answer("200 OK", "", "x"));
+    LoopbackServer server(http_answer("200 OK", "", "x"));
     Reentry r;
     zv_curl_new(&r.item);
-    zv_curl_set_callback_func(r.item, reentrant_response);
+    zv_curl_set_callback_func(r.item, [](int, TransferResponse *, void *user_data) {
+        Reentry *r = static_cast<Reentry *>(user_data);
+        r->send_result = zv_curl_send_request(r->item);
+        r->cancel_result = zv_curl_cancel_request(r->item);
+        zv_curl_free(r->item);
+        zv_curl_new(&r->item); // the old record is reclaimed after this report
+        r->done = true;
+    });
     zv_curl_set_user_data(r.item, &r);
     zv_curl_set_url(r.item, server.url().c_str());
     ASSERT_EQ(zv_curl_send_request(r.item), 0);
@@ -652,10 +415,8 @@ TEST_F(EngineTest, ResponseCallbackMayReleaseItsItemButNotCallBackIn)
     EXPECT_EQ(r.cancel_result, ZV_CURL_ERROR_OPERATION_FAILED);
     EXPECT_EQ(r.item->url, nullptr);
     zv_curl_delete(&r.item);
-    Outcome o; // the engine goes on
-    Item item;
-    prepare(item, o, ZV_CURL_HTTP_METHOD_GET, server.url());
-    exchange(item, o);
+    Item o(ZV_CURL_HTTP_METHOD_GET, server.url()); // the engine goes on
+    exchange(o);
 }
 
 // A gated server holds a large upload after its first read; these tests act on it then.
@@ -670,77 +431,61 @@ class RunningUploadTest : public EngineTest
         std::string path = tmp_.file("big.mp4");
         ASSERT_TRUE(zv_test::write_file(path, pattern(kSize)));
         server_.set_gated(true);
-        prepare_put(upload_, o_, server_.url("/up"), path, kSize, 0);
-        ASSERT_EQ(zv_curl_send_request(upload_.p), 0);
-        ASSERT_TRUE(wait_for([this] { return o_.progress_count() > 0; }, kWaitMs));
+        upload_ = std::make_unique<Item>(server_.url("/up"), path, kSize, 0);
+        ASSERT_EQ(zv_curl_send_request(upload_->p), 0);
+        ASSERT_TRUE(wait_for([this] { return upload_->progress_count() > 0; }, kWaitMs));
     }
 
     // Lets the worker run a whole other request: what the held upload would do, it has had
     // the chance to do by then.
     void run_another_request()
     {
-        Outcome other;
-        Item item;
-        prepare(item, other, ZV_CURL_HTTP_METHOD_GET, side_.url());
-        exchange(item, other);
+        Item other(ZV_CURL_HTTP_METHOD_GET, side_.url());
+        exchange(other);
         EXPECT_EQ(other.http_code, 200);
     }
 
-    LoopbackServer server_{answer("201 Created")};
-    LoopbackServer side_{answer("200 OK")};
-    Outcome o_;
-    Item upload_;
+    LoopbackServer server_{http_answer("201 Created")};
+    LoopbackServer side_{http_answer("200 OK")};
+    std::unique_ptr<Item> upload_;
 };
 
 TEST_F(RunningUploadTest, PauseHoldsTheRequestAndResumeFinishesItOnTheSameConnection)
 {
-    ASSERT_EQ(zv_curl_pause_request(upload_.p), 0);
-    size_t reads = o_.progress_count();
+    ASSERT_EQ(zv_curl_pause_request(upload_->p), 0);
+    size_t reads = upload_->progress_count();
     server_.set_gated(false);
     run_another_request();
-    EXPECT_EQ(o_.progress_count(), reads);
-    EXPECT_EQ(o_.call_count(), 0);
+    EXPECT_EQ(upload_->progress_count(), reads);
+    EXPECT_EQ(upload_->call_count(), 0);
     EXPECT_LT(server_.body_bytes, kSize);
 
-    ASSERT_EQ(zv_curl_resume_request(upload_.p), 0);
-    ASSERT_TRUE(o_.wait_answer());
-    std::lock_guard<std::mutex> lock(o_.m);
-    EXPECT_EQ(o_.http_code, 201);
-    EXPECT_EQ(o_.progress.back(), std::make_pair(100, static_cast<int64_t>(kSize)));
+    ASSERT_EQ(zv_curl_resume_request(upload_->p), 0);
+    ASSERT_TRUE(upload_->wait_answer());
+    EXPECT_EQ(upload_->http_code, 201);
+    EXPECT_EQ(upload_->progress.back(), std::make_pair(100, static_cast<int64_t>(kSize)));
     EXPECT_EQ(server_.body_bytes, kSize);
-    EXPECT_EQ(server_.connections_, 1);
+    EXPECT_EQ(server_.connections, 1);
 }
 
 TEST_F(RunningUploadTest, CancelClosesTheConnectionAndNoAnswerFollows)
 {
-    ASSERT_EQ(zv_curl_cancel_request(upload_.p), 0);
+    ASSERT_EQ(zv_curl_cancel_request(upload_->p), 0);
     server_.set_gated(false);
     EXPECT_TRUE(wait_for([this] { return server_.closed_by_peer > 0; }, kWaitMs));
     run_another_request();
-    EXPECT_EQ(o_.call_count(), 0);
+    EXPECT_EQ(upload_->call_count(), 0);
     EXPECT_LT(server_.body_bytes, kSize);
-    EXPECT_EQ(zv_curl_cancel_request(upload_.p), ZV_CURL_ERROR_INVALID_PARAMETER);
-}
-
-TEST_F(RunningUploadTest, DeletingTheItemDetachesItsTransfer)
-{
-    zv_curl_delete(&upload_.p);
-    EXPECT_EQ(upload_.p, nullptr);
-    server_.set_gated(false);
-    EXPECT_TRUE(wait_for([this] { return server_.closed_by_peer > 0; }, kWaitMs));
-    run_another_request();
-    EXPECT_EQ(o_.call_count(), 0);
+    EXPECT_EQ(zv_curl_cancel_request(upload_->p), ZV_CURL_ERROR_INVALID_PARAMETER);
 }
 
 TEST_F(RunningUploadTest, StopNeverHangsWithRequestsInFlight)
 {
-    LoopbackServer silent([] { return kHang; });
-    Outcome hanging;
-    Item query;
-    prepare(query, hanging, ZV_CURL_HTTP_METHOD_GET, silent.url());
-    ASSERT_EQ(zv_curl_send_request(query.p), 0);
+    LoopbackServer silent(kHang);
+    Item hanging(ZV_CURL_HTTP_METHOD_GET, silent.url());
+    ASSERT_EQ(zv_curl_send_request(hanging.p), 0);
     ASSERT_TRUE(wait_for([&] { return silent.request_count() > 0; }, kWaitMs));
-    ASSERT_EQ(zv_curl_pause_request(upload_.p), 0);
+    ASSERT_EQ(zv_curl_pause_request(upload_->p), 0);
 
     std::atomic<bool> stopped{false};
     std::thread stopper([&] {
@@ -752,81 +497,13 @@ TEST_F(RunningUploadTest, StopNeverHangsWithRequestsInFlight)
         _exit(1);
     }
     stopper.join();
-    EXPECT_EQ(o_.call_count(), 0);
+    EXPECT_EQ(upload_->call_count(), 0);
     EXPECT_EQ(hanging.call_count(), 0);
 
     zv_curl_finalize_service(); // harmless twice; the engine starts again
     ASSERT_EQ(zv_curl_init_service(), ZV_CURL_ERROR_NONE);
     server_.set_gated(false);
     run_another_request();
-}
-
-// The descriptors of this process: how many, or how many name `path`.
-int descriptors(const std::string &path = "")
-{
-    int n = 0;
-    DIR *dir = opendir("/proc/self/fd");
-    while (const dirent *entry = dir ? readdir(dir) : nullptr) {
-        char target[4096];
-        std::string link = std::string("/proc/self/fd/") + entry->d_name;
-        ssize_t len = readlink(link.c_str(), target, sizeof target - 1);
-        if (entry->d_name[0] != '.' &&
-            (path.empty() || std::string(target, len > 0 ? len : 0) == path))
-            ++n;
-    }
-    if (dir)
-        closedir(dir);
-    return path.empty() ? n - 1 : n;
-}
-
-// Started under an open-file limit with 40 descriptors to spare, the engine runs at most as
-// many transfers as they can hold (a connection and a file each); the others wait in the
-// engine, and their wait does not count against their time-out. A finished upload keeps no
-// descriptor of its file.
-TEST(EngineFileLimit, TransfersPastTheLimitWaitTheirTurnAndAllComplete)
-{
-    zv_test::TempDir tmp;
-    const int kSpare = 40;
-    rlimit saved;
-    ASSERT_EQ(getrlimit(RLIMIT_NOFILE, &saved), 0);
-    rlimit low = saved;
-    low.rlim_cur = static_cast<rlim_t>(descriptors() + kSpare);
-    ASSERT_EQ(setrlimit(RLIMIT_NOFILE, &low), 0);
-    int started = zv_curl_init_service();
-    setrlimit(RLIMIT_NOFILE, &saved); // the servers of the test need their own descriptors
-    ASSERT_EQ(started, ZV_CURL_ERROR_NONE);
-
-    LoopbackServer held(answer("201 Created"));
-    LoopbackServer fast(answer("200 OK"));
-    held.set_gated(true);
-    std::string path = tmp.file("clip.mp4");
-    ASSERT_TRUE(zv_test::write_file(path, pattern(4096)));
-    const int kHeld = kSpare / 2 + 1, kWaiting = 20;
-    std::vector<Outcome> outcomes(kHeld + kWaiting);
-    std::vector<Item> items(kHeld + kWaiting);
-    for (int i = 0; i < kHeld + kWaiting; ++i) {
-        if (i < kHeld) {
-            prepare_put(items[i], outcomes[i], held.url("/up"), path, 4096, 0);
-        } else {
-            prepare(items[i], outcomes[i], ZV_CURL_HTTP_METHOD_GET, fast.url());
-            zv_curl_set_timeout(items[i].p, 1000);
-        }
-        ASSERT_EQ(zv_curl_send_request(items[i].p), 0);
-    }
-    // Longer than the waiting requests' time-out.
-    std::this_thread::sleep_for(std::chrono::milliseconds(1500));
-    EXPECT_GE(held.connections_, 1);
-    EXPECT_LE(held.connections_, kSpare / 2);
-    EXPECT_EQ(fast.connections_, 0) << "the later requests wait while the held ones run";
-
-    held.set_gated(false);
-    for (int i = 0; i < kHeld + kWaiting; ++i) {
-        ASSERT_TRUE(outcomes[i].wait_answer()) << i;
-        std::lock_guard<std::mutex> lock(outcomes[i].m);
-        EXPECT_EQ(outcomes[i].http_code, i < kHeld ? 201 : 200) << i;
-    }
-    EXPECT_EQ(descriptors(path), 0);
-    zv_curl_finalize_service();
 }
 
 } // namespace

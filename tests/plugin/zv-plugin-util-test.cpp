@@ -1,130 +1,93 @@
-// Plugin utilities: media types, file names and sizes, and the answer extractors.
+// Plugin utilities: media types, file names and sizes, ids, and the answer extractors.
 #include <gtest/gtest.h>
 
 #include <glib.h>
+#include <string.h>
 #include <time.h>
 #include <unistd.h>
 
 #include <optional>
 #include <string>
 
+#include "zv-ext-util.h"
 #include "zv-plugin-util.h"
 #include "zv-test-util.h"
 
 namespace
 {
 
-using Extractor = char *(*)(char *);
-
-// Runs an extractor on a writable copy of text; nullopt for NULL.
-std::optional<std::string> extract(Extractor fn, const char *text)
-{
-    gchar *copy = g_strdup(text);
-    gchar *value = fn(copy);
-    std::optional<std::string> out;
-    if (value)
-        out = value;
-    g_free(value);
-    g_free(copy);
-    return out;
-}
-
 TEST(PluginUtil, MediaTypeFromTheLastExtension)
 {
-    struct Case {
-        const char *path;
-        const char *type; // NULL: unknown
-    };
-    const Case cases[] = {
-        {"/media/DCIM/Clip.MP4", "video/mp4"},
-        {"/media/a.JPEG", "image/jpeg"},
-        {"a.jpg", "image/jpeg"},
-        {"x.png", "image/png"},
-        {"x.BMP", "image/bmp"},
-        {"x.gif", "image/gif"},
-        {"x.tiff", "image/tiff"},
-        {"x.wmv", "video/x-ms-wmv"},
-        {"x.mp3", "audio/mp3"},
-        {"x.3GP", "video/3gp"},
-        {"x.avi", "video/x-msvideo"},
-        {"x.doc", "application/msword"},
-        {"x.pdf", "application/pdf"},
-        {"/media/clip.tar.zip", "application/zip"}, // only the last dot counts
-        {"x.txt", "text/plain"},
-        {"/media/clip", NULL},
-        {"/media/clip.mov", NULL},
-        {"x.tif", NULL},
-        {"x.jpe", NULL},
-        {"x.mkv", NULL},
-        {"x.mp4 ", NULL}, // exact match only
-        {"/dir.old/clip", NULL},
-        {"/dir.mp4/clip", NULL},
-        {NULL, NULL},
-    };
-    for (const Case &c : cases) {
-        const char *type = zv_plugin_util_get_file_mime(c.path);
-        if (c.type)
-            EXPECT_STREQ(type, c.type) << c.path;
-        else
-            EXPECT_EQ(type, nullptr) << (c.path ? c.path : "NULL");
-    }
     // A path longer than the working buffer is cut: its extension past 4095 is lost.
-    std::string long_path = std::string(4095, 'a') + ".mp4";
-    EXPECT_EQ(zv_plugin_util_get_file_mime(long_path.c_str()), nullptr);
-    std::string fits = std::string(4090, 'a') + ".mp4";
-    EXPECT_STREQ(zv_plugin_util_get_file_mime(fits.c_str()), "video/mp4");
+    const std::string cut = std::string(4095, 'a') + ".mp4", fits = std::string(4090, 'a') + ".mp4";
+    // clang-format off
+    const std::pair<const char *, const char *> cases[] = { // NULL type: unknown
+        {"/media/DCIM/Clip.MP4", "video/mp4"}, {"/media/a.JPEG", "image/jpeg"},
+        {"a.jpg", "image/jpeg"}, {"x.png", "image/png"}, {"x.BMP", "image/bmp"},
+        {"x.gif", "image/gif"}, {"x.tiff", "image/tiff"}, {"x.wmv", "video/x-ms-wmv"},
+        {"x.mp3", "audio/mp3"}, {"x.3GP", "video/3gp"}, {"x.avi", "video/x-msvideo"},
+        {"x.doc", "application/msword"}, {"x.pdf", "application/pdf"}, {"x.txt", "text/plain"},
+        {"/media/clip.tar.zip", "application/zip"}, // only the last dot counts
+        {"/media/clip", NULL}, {"/media/clip.mov", NULL}, {"x.tif", NULL}, {"x.jpe", NULL},
+        {"x.mkv", NULL}, {"x.mp4 ", NULL}, {"/dir.old/clip", NULL}, {"/dir.mp4/clip", NULL},
+        {NULL, NULL}, {cut.c_str(), NULL}, {fits.c_str(), "video/mp4"},
+    };
+    // clang-format on
+    for (auto [path, type] : cases) {
+        const char *got = zv_plugin_util_get_file_mime(path);
+        EXPECT_EQ(std::string(got ? got : "NULL"), type ? type : "NULL") << (path ? path : "NULL");
+    }
 }
 
 TEST(PluginUtil, FileNameIsTheLastComponent)
 {
     const std::pair<const char *, const char *> cases[] = {
-        {"/a/b/c.mp4", "c.mp4"}, {"c.mp4", "c.mp4"}, {"/a/b/", ""}, {"/", ""}};
+        {"/a/b/c.mp4", "c.mp4"}, {"c.mp4", "c.mp4"}, {"/a/b/", ""}, {"/", ""}, {NULL, NULL}};
     for (auto [path, name] : cases) {
         gchar *got = zv_plugin_util_get_file_name(path);
-        EXPECT_STREQ(got, name) << path;
+        EXPECT_STREQ(got, name) << (path ? path : "NULL");
         g_free(got);
     }
-    EXPECT_EQ(zv_plugin_util_get_file_name(NULL), nullptr);
 }
 
-TEST(PluginUtil, FileSize)
+// The plugin's and the service's twins: sizes past 4 GiB, -1 for what cannot be read, and
+// an id that is the current second.
+TEST(PluginUtil, FileSizesAndIdsOfBothUtilities)
 {
     zv_test::TempDir tmp;
     ASSERT_TRUE(zv_test::write_file(tmp.file("empty"), ""));
     ASSERT_TRUE(zv_test::write_file(tmp.file("ten"), "0123456789"));
     ASSERT_TRUE(zv_test::write_file(tmp.file("video"), ""));
-    ASSERT_EQ(truncate(tmp.file("video").c_str(), 5000000000LL), 0); // sparse, past 4 GiB
-    EXPECT_EQ(zv_plugin_util_get_file_size(tmp.file("empty").c_str()), 0);
-    EXPECT_EQ(zv_plugin_util_get_file_size(tmp.file("ten").c_str()), 10);
-    EXPECT_EQ(zv_plugin_util_get_file_size(tmp.file("video").c_str()), 5000000000LL);
-    EXPECT_EQ(zv_plugin_util_get_file_size(tmp.file("missing").c_str()), -1);
-    EXPECT_EQ(zv_plugin_util_get_file_size(NULL), -1);
+    ASSERT_EQ(truncate(tmp.file("video").c_str(), 5000000000LL), 0); // sparse
+    const std::string empty = tmp.file("empty"), ten = tmp.file("ten"),
+                      video = tmp.file("video"), missing = tmp.file("missing");
+    const std::pair<const char *, int64_t> sizes[] = {
+        {empty.c_str(), 0}, {ten.c_str(), 10}, {video.c_str(), 5000000000LL},
+        {missing.c_str(), -1}, {NULL, -1}};
+    for (auto size_of : {zv_plugin_util_get_file_size, zv_ext_util_get_file_size}) {
+        for (auto [path, size] : sizes)
+            EXPECT_EQ(size_of(path), size) << (path ? path : "NULL");
+    }
+    for (auto id_now : {+[] { return static_cast<int64_t>(zv_plugin_util_generate_id()); },
+                        +[] { return static_cast<int64_t>(zv_ext_util_generate_id()); }}) {
+        int64_t before = time(NULL), id = id_now(), after = time(NULL);
+        EXPECT_GE(id, before);
+        EXPECT_LE(id, after);
+    }
 }
-
-TEST(PluginUtil, IdIsTheCurrentSecond)
-{
-    time_t before = time(NULL);
-    int id = zv_plugin_util_generate_id();
-    time_t after = time(NULL);
-    EXPECT_GE(id, static_cast<int>(before));
-    EXPECT_LE(id, static_cast<int>(after));
-}
-
-struct ExtractCase {
-    const char *what;
-    Extractor fn;
-    const char *text;
-    const char *value; // NULL: no value
-};
 
 TEST(PluginUtil, ExtractorsCutTheirValueOutOfTheAnswer)
 {
-    using namespace std::string_literals;
     const auto loc = zv_plugin_util_get_location_value;
     const auto etag = zv_plugin_util_get_video_id_value;
     const auto range = zv_plugin_util_get_range_value;
     const auto token = zv_plugin_util_get_token_value;
-    const ExtractCase cases[] = {
+    const struct {
+        const char *what;
+        char *(*fn)(char *);
+        const char *text;
+        const char *value; // NULL: no value
+    } cases[] = {
         {"location", loc, "HTTP/1.1 201 Created\r\nLocation: http://up.example/up?id=9&x=1\r\n\r\n",
          "http://up.example/up?id=9&x=1"},
         {"location, two spaces keep one", loc, "HTTP/1.1 201 Created\r\nLocation:  http://u/\r\n",
@@ -158,25 +121,23 @@ TEST(PluginUtil, ExtractorsCutTheirValueOutOfTheAnswer)
         {"only quotes after", token, "{\"a\": \"\"\"", NULL},
         {"escaped quote ends the value", token, "{\"a\": \"x\\\"y\"}", "x\\"},
     };
-    for (const ExtractCase &c : cases) {
-        std::optional<std::string> got = extract(c.fn, c.text);
-        if (c.value) {
-            EXPECT_EQ(got, std::optional<std::string>(c.value)) << c.what;
-        } else {
-            EXPECT_EQ(got, std::nullopt) << c.what;
-        }
+    for (const auto &c : cases) {
+        gchar *copy = g_strdup(c.text);
+        gchar *value = c.fn(copy);
+        EXPECT_EQ(value ? std::optional<std::string>(value) : std::nullopt,
+                  c.value ? std::optional<std::string>(c.value) : std::nullopt)
+            << c.what;
+        g_free(value);
+        g_free(copy);
     }
-    for (Extractor fn : {loc, etag, range, token})
+    for (auto fn : {loc, etag, range, token})
         EXPECT_EQ(fn(NULL), nullptr);
-}
 
-TEST(PluginUtil, ExtractorsCutTheTextInPlace)
-{
+    // The text is cut in place: the header name lost its colon and the value its line end.
     char text[] = "HTTP/1.1 201\r\nLocation: http://u/\r\nX: y\r\n";
-    gchar *value = zv_plugin_util_get_location_value(text);
+    gchar *value = loc(text);
     EXPECT_STREQ(value, "http://u/");
     g_free(value);
-    // The header name lost its colon and the value its line end.
     EXPECT_STREQ(text, "HTTP/1.1 201\r\nLocation");
     EXPECT_STREQ(text + strlen("HTTP/1.1 201\r\nLocation:"), " http://u/");
 }

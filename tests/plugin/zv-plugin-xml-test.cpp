@@ -1,19 +1,11 @@
 // The Atom entry of a metadata upload, byte for byte, and the category document read from a
 // loopback server.
-#include <arpa/inet.h>
 #include <gtest/gtest.h>
-#include <netinet/in.h>
-#include <stdlib.h>
-#include <sys/socket.h>
-#include <unistd.h>
 
 #include <map>
-#include <string>
-#include <thread>
-#include <vector>
 
+#include "zv-plugin-test-server.h"
 #include "zv-plugin-xml.h"
-#include "zv-test-util.h"
 
 namespace {
 
@@ -25,33 +17,16 @@ const std::string GEO_NS = " xmlns:georss=\"http://www.georss.org/georss\""
                            " xmlns:gml=\"http://www.opengis.net/gml\"";
 const std::string SCHEME = "http://data.test:81/schemas/2007/categories.cat";
 
-struct ComposeCase {
-    const char *name;
-    const char *title, *description, *category, *keywords, *location, *permission;
-    bool is_private;
-    const char *position;
-    std::string expected;
-};
-
-class ComposeTest : public ::testing::Test {
-protected:
-    void SetUp() override { setenv("ZV_DATA_HOST", "data.test:81", 1); }
-    void TearDown() override { unsetenv("ZV_DATA_HOST"); }
-
-    static std::string compose(const ComposeCase &c)
-    {
-        char *doc = zv_plugin_xml_compose_request(c.title, c.description, c.category, c.keywords,
-                                                  c.location, c.permission, c.is_private,
-                                                  c.position);
-        std::string text = doc ? doc : "(null)";
-        free(doc);
-        return text;
-    }
-};
-
-TEST_F(ComposeTest, DocumentsByteForByte)
+TEST(ComposeTest, DocumentsByteForByte)
 {
-    const ComposeCase cases[] = {
+    setenv("ZV_DATA_HOST", "data.test:81", 1);
+    const struct {
+        const char *name;
+        const char *title, *description, *category, *keywords, *location, *permission;
+        bool is_private;
+        const char *position;
+        std::string expected;
+    } cases[] = {
         // Everything present: namespaces in order, children in document order.
         {"all parts", "Clip", "At the beach", "People", "sea, sand", "Busan", "denied", true,
          "37.500000 127.000000",
@@ -106,56 +81,15 @@ TEST_F(ComposeTest, DocumentsByteForByte)
         {"nothing given", nullptr, nullptr, nullptr, nullptr, nullptr, nullptr, false, nullptr,
          DECL + OPEN + ">\n  <media:group/>\n</entry>"},
     };
-    for (const auto &c : cases)
-        EXPECT_EQ(compose(c), c.expected) << c.name;
+    for (const auto &c : cases) {
+        char *doc = zv_plugin_xml_compose_request(c.title, c.description, c.category, c.keywords,
+                                                  c.location, c.permission, c.is_private,
+                                                  c.position);
+        EXPECT_EQ(doc ? doc : "(null)", c.expected) << c.name;
+        free(doc);
+    }
+    unsetenv("ZV_DATA_HOST");
 }
-
-// Answers each GET with the document registered for its target, 404 for any other.
-class DocumentServer {
-public:
-    explicit DocumentServer(std::map<std::string, std::string> docs) : docs_(std::move(docs))
-    {
-        fd_ = zv_test::listen_loopback(&port_);
-        thread_ = std::thread([this] { serve(); });
-    }
-    ~DocumentServer()
-    {
-        shutdown(fd_, SHUT_RDWR); // ends the accept below
-        thread_.join();
-        close(fd_);
-    }
-    std::string host() const { return "127.0.0.1:" + std::to_string(port_); }
-
-private:
-    void serve()
-    {
-        int conn;
-        while ((conn = accept(fd_, nullptr, nullptr)) >= 0) {
-            std::string request;
-            char buf[1024];
-            ssize_t n;
-            while (request.find("\r\n\r\n") == std::string::npos &&
-                   (n = read(conn, buf, sizeof buf)) > 0)
-                request.append(buf, (size_t)n);
-            const size_t start = request.find(' ') + 1;
-            const auto doc = docs_.find(request.substr(start, request.find(' ', start) - start));
-            const std::string body = doc == docs_.end() ? "not found" : doc->second;
-            const std::string answer =
-                std::string(doc == docs_.end() ? "HTTP/1.0 404 Not Found" : "HTTP/1.0 200 OK") +
-                "\r\nContent-Type: text/xml\r\nContent-Length: " + std::to_string(body.size()) +
-                "\r\n\r\n" + body;
-            if (write(conn, answer.data(), answer.size()) < 0) {
-                // The client went away; nothing to answer.
-            }
-            close(conn);
-        }
-    }
-
-    std::map<std::string, std::string> docs_;
-    int fd_ = -1;
-    int port_ = 0;
-    std::thread thread_;
-};
 
 TEST(CategoryListTest, LabelsOfCategoryElementsOnly)
 {
@@ -183,7 +117,12 @@ TEST(CategoryListTest, LabelsOfCategoryElementsOnly)
         {"no document", {}, nullptr, {}},
     };
     for (const auto &c : cases) {
-        DocumentServer server(c.docs);
+        // Each GET gets the document registered for its target, any other a 404.
+        zv_plugin_test::LoopbackServer server([&c](const std::string &request) {
+            auto doc = c.docs.find(request.substr(4, request.find(' ', 4) - 4));
+            return doc == c.docs.end() ? zv_plugin_test::http_answer("404 Not Found")
+                                       : zv_plugin_test::http_answer("200 OK", "", doc->second);
+        });
         setenv("ZV_DATA_HOST", server.host().c_str(), 1);
         GList *list = zv_plugin_xml_get_category_list(c.language);
         std::vector<std::string> labels;

@@ -12,8 +12,7 @@
 namespace
 {
 
-using zv_upload_test::add_row;
-using zv_upload_test::stored_rows;
+using namespace zv_upload_test;
 
 class UploadListTest : public ::testing::Test
 {
@@ -27,11 +26,15 @@ class UploadListTest : public ::testing::Test
         zv_ext_db_close();
     }
 
-    std::vector<int> job_ids() const
+    UploadItem *job(int index)
+    {
+        return static_cast<UploadItem *>(g_list_nth_data(ad_.job_list, index));
+    }
+    std::vector<int> job_ids()
     {
         std::vector<int> ids;
-        for (GList *l = ad_.job_list; l; l = l->next)
-            ids.push_back(static_cast<UploadItem *>(l->data)->historyid);
+        for (int i = 0; job(i); i++)
+            ids.push_back(job(i)->historyid);
         return ids;
     }
 
@@ -39,22 +42,19 @@ class UploadListTest : public ::testing::Test
     AppData ad_ = {};
 };
 
-TEST_F(UploadListTest, FullLoadPutsNewestFirstAndTakesReadyRowsAsWaiting)
+TEST_F(UploadListTest, LoadsPutNewestFirstAndTakeReadyRowsAsWaiting)
 {
     ASSERT_TRUE(add_row(1, ZV_UPLOAD_STATUS_READY, 1.0, "/v/one.mp4", "One"));
     ASSERT_TRUE(
         add_row(3, ZV_UPLOAD_STATUS_COMPLETED, 3.0, "/v/three.mp4", "Three", "http://up/3", 100));
     ASSERT_TRUE(add_row(2, ZV_UPLOAD_STATUS_PAUSED, 2.0, "/v/two.mp4", "Two", "http://up/2", 40));
-
     zv_upload_list_load_full_item(&ad_);
-
     EXPECT_EQ(job_ids(), (std::vector<int>{3, 2, 1}));
     auto rows = stored_rows();
     EXPECT_EQ(rows[1].status, ZV_UPLOAD_STATUS_WAITING);
     EXPECT_EQ(rows[2].status, ZV_UPLOAD_STATUS_PAUSED);
     EXPECT_EQ(rows[3].status, ZV_UPLOAD_STATUS_COMPLETED);
-
-    const UploadItem *paused = static_cast<UploadItem *>(g_list_nth_data(ad_.job_list, 1));
+    const UploadItem *paused = job(1);
     EXPECT_STREQ(paused->title, "Two");
     EXPECT_STREQ(paused->filename, "/v/two.mp4");
     EXPECT_STREQ(paused->url, "http://up/2");
@@ -63,76 +63,40 @@ TEST_F(UploadListTest, FullLoadPutsNewestFirstAndTakesReadyRowsAsWaiting)
     EXPECT_EQ(paused->status, ZV_UPLOAD_STATUS_PAUSED);
     EXPECT_EQ(paused->offset, 0);
     EXPECT_EQ(paused->handle, nullptr);
-    const UploadItem *waiting = static_cast<UploadItem *>(g_list_nth_data(ad_.job_list, 2));
-    EXPECT_EQ(waiting->status, ZV_UPLOAD_STATUS_WAITING);
-    EXPECT_EQ(waiting->url, nullptr);
-}
+    EXPECT_EQ(job(2)->status, ZV_UPLOAD_STATUS_WAITING);
+    EXPECT_EQ(job(2)->url, nullptr);
 
-TEST_F(UploadListTest, ReadyLoadAddsOnlyRowsRecordedSince)
-{
-    ASSERT_TRUE(add_row(1, ZV_UPLOAD_STATUS_READY, 1.0, "/v/one.mp4"));
-    zv_upload_list_load_full_item(&ad_);
+    // The first ready load finds nothing new; a later one adds only the READY rows since.
     zv_upload_list_load_ready_item(&ad_);
-    EXPECT_EQ(job_ids(), (std::vector<int>{1})) << "the first ready load finds nothing new";
-
+    EXPECT_EQ(job_ids(), (std::vector<int>{3, 2, 1}));
     ASSERT_TRUE(add_row(5, ZV_UPLOAD_STATUS_UPLOADING, 5.0, "/v/five.mp4"));
     ASSERT_TRUE(add_row(4, ZV_UPLOAD_STATUS_READY, 4.0, "/v/four.mp4"));
     ASSERT_TRUE(add_row(6, ZV_UPLOAD_STATUS_READY, 6.0, "/v/six.mp4"));
     zv_upload_list_load_ready_item(&ad_);
-
-    EXPECT_EQ(job_ids(), (std::vector<int>{6, 4, 1}));
+    EXPECT_EQ(job_ids(), (std::vector<int>{6, 4, 3, 2, 1}));
     EXPECT_EQ(stored_rows()[4].status, ZV_UPLOAD_STATUS_WAITING);
     EXPECT_EQ(stored_rows()[5].status, ZV_UPLOAD_STATUS_UPLOADING);
 }
 
 TEST_F(UploadListTest, ResetWritesUnfinishedRowsBack)
 {
-    struct Case {
-        int before;
-        int after;
-    };
-    const Case cases[] = {
+    const std::pair<int, int> cases[] = {
+        // status before, after
         {ZV_UPLOAD_STATUS_READY, ZV_UPLOAD_STATUS_READY},
         {ZV_UPLOAD_STATUS_WAITING, ZV_UPLOAD_STATUS_READY},
         {ZV_UPLOAD_STATUS_PAUSED, ZV_UPLOAD_STATUS_PAUSED},
         {ZV_UPLOAD_STATUS_UPLOADING, ZV_UPLOAD_STATUS_PAUSED},
         {ZV_UPLOAD_STATUS_COMPLETED, ZV_UPLOAD_STATUS_COMPLETED},
     };
-    int id = 10;
-    for (const Case &c : cases) {
-        ASSERT_TRUE(add_row(id, c.before, id, "/v/x.mp4", "X", "http://up/x", 30));
-        id++;
-    }
-
+    for (auto [before, after] : cases)
+        ASSERT_TRUE(add_row(10 + before, before, before, "/v/x.mp4", "X", "http://up/x", 30));
     zv_upload_list_reset_full_item(&ad_);
-
     auto rows = stored_rows();
-    id = 10;
-    for (const Case &c : cases) {
-        EXPECT_EQ(rows[id].status, c.after) << "status before: " << c.before;
-        EXPECT_EQ(rows[id].percent, 30);
-        EXPECT_EQ(rows[id].url, "http://up/x");
-        id++;
+    for (auto [before, after] : cases) {
+        EXPECT_EQ(rows[10 + before].status, after) << "status before: " << before;
+        EXPECT_EQ(rows[10 + before].percent, 30);
+        EXPECT_EQ(rows[10 + before].url, "http://up/x");
     }
-}
-
-TEST_F(UploadListTest, StoreWritesPercentStatusAndUrl)
-{
-    ASSERT_TRUE(add_row(7, ZV_UPLOAD_STATUS_WAITING, 1.0, "/v/x.mp4", "X", "http://old"));
-    UploadItem job_item = {};
-    job_item.historyid = 7;
-    job_item.percent = 55;
-    job_item.status = ZV_UPLOAD_STATUS_UPLOADING;
-    job_item.url = const_cast<char *>("http://new");
-    zv_upload_list_store_item(&job_item);
-    auto row = stored_rows()[7];
-    EXPECT_EQ(row.status, ZV_UPLOAD_STATUS_UPLOADING);
-    EXPECT_EQ(row.percent, 55);
-    EXPECT_EQ(row.url, "http://new");
-
-    job_item.url = nullptr;
-    zv_upload_list_store_item(&job_item);
-    EXPECT_FALSE(stored_rows()[7].has_url);
 }
 
 } // namespace

@@ -1,5 +1,5 @@
-// Helpers of the controller's tests: the process log in one file with marks, history rows
-// by hand, and the notification tray as the platform keeps it in files.
+// Helpers of the controller's tests: running the main loop as the application does, history
+// rows by hand, the notification tray as the platform keeps it in files, and platform keys.
 #pragma once
 
 #include <Ecore.h>
@@ -17,9 +17,10 @@
 namespace zv_upload_test
 {
 
-// Runs the main loop as the application does (idlers included, which single iterations
-// skip) until pred() holds or timeout_ms passes. *quit_by_other (when given) tells whether
-// something else, such as elm_exit, ended the loop first. True when pred() holds.
+// Runs the main loop as the application does until pred() holds or timeout_ms passes.
+// *quit_by_other (when given) tells whether something else, such as elm_exit, ended the loop first.
+// True when pred() holds. Unlike zv_test::wait_for (single iterations), it runs idlers, and timers
+// added meanwhile.
 inline bool run_until(const std::function<bool()> &pred, int timeout_ms = 5000,
                       bool *quit_by_other = nullptr)
 {
@@ -51,8 +52,6 @@ inline bool run_until(const std::function<bool()> &pred, int timeout_ms = 5000,
     }
     return pred();
 }
-
-using LogFile = zv_test::LogFile;
 
 inline bool add_row(int historyid, int status, double date, const char *filename,
                     const char *title = "Clip", const char *url = nullptr, int percent = 0)
