@@ -31,7 +31,8 @@ std::map<pid_t, int> &reaped_by_loop()
         ECORE_EXE_EVENT_DEL,
         [](void *, int, void *event) -> Eina_Bool {
             auto *del = static_cast<Ecore_Exe_Event_Del *>(event);
-            statuses[del->pid] = del->signalled ? (del->exit_signal & 0x7f) : ((del->exit_code & 0xff) << 8);
+            statuses[del->pid] =
+                del->signalled ? (del->exit_signal & 0x7f) : ((del->exit_code & 0xff) << 8);
             return ECORE_CALLBACK_PASS_ON;
         },
         nullptr);
@@ -142,7 +143,8 @@ Child::~Child()
     }
 }
 
-bool Child::start(const std::vector<std::string> &argv, const std::string &out_path, const Env &env, rlim_t nofile)
+bool Child::start(const std::vector<std::string> &argv, const std::string &out_path, const Env &env,
+                  rlim_t nofile)
 {
     reaped_by_loop();
     killed_ = false;
@@ -152,7 +154,8 @@ bool Child::start(const std::vector<std::string> &argv, const std::string &out_p
     if (pid_ == 0) {
         int in = open("/dev/null", O_RDONLY);
         dup2(in, 0);
-        int out = out_path.empty() ? -1 : open(out_path.c_str(), O_WRONLY | O_CREAT | O_APPEND, 0600);
+        int out =
+            out_path.empty() ? -1 : open(out_path.c_str(), O_WRONLY | O_CREAT | O_APPEND, 0600);
         if (out >= 0) {
             dup2(out, 1);
             dup2(out, 2);
@@ -205,7 +208,8 @@ bool Child::wait_exit(int timeout_ms, int *status)
 
 bool Child::ended_well() const
 {
-    return exited_ && (exit_status() == 0 || (killed_ && WIFSIGNALED(status_) && WTERMSIG(status_) == SIGKILL));
+    return exited_ && (exit_status() == 0 ||
+                       (killed_ && WIFSIGNALED(status_) && WTERMSIG(status_) == SIGKILL));
 }
 
 int Child::exit_status() const
@@ -264,7 +268,8 @@ int listen_loopback(int *port, int backlog)
     addr.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
     socklen_t len = sizeof addr;
     if (fd < 0 || bind(fd, reinterpret_cast<sockaddr *>(&addr), len) != 0 ||
-        listen(fd, backlog) != 0 || getsockname(fd, reinterpret_cast<sockaddr *>(&addr), &len) != 0) {
+        listen(fd, backlog) != 0 ||
+        getsockname(fd, reinterpret_cast<sockaddr *>(&addr), &len) != 0) {
         if (fd >= 0)
             close(fd);
         return -1;

@@ -94,7 +94,10 @@ public:
     const std::string &path() const { return path_; }
     void mark() { mark_ = read_file(path_).size(); }
     std::string since_mark() const;
-    bool logged(const std::string &text) const { return since_mark().find(text) != std::string::npos; }
+    bool logged(const std::string &text) const
+    {
+        return since_mark().find(text) != std::string::npos;
+    }
 
 private:
     std::string path_;
