@@ -141,25 +141,16 @@ long long Logged::range_start() const
 
 pid_t spawn_server(const std::vector<std::string> &argv, int *port, int *tls_port)
 {
-    int out[2];
-    if (pipe(out) != 0)
-        return -1;
-    pid_t pid = fork();
-    if (pid == 0) {
-        dup2(out[1], 1);
-        close(out[0]);
-        close(out[1]);
-        exec_argv(argv);
-    }
-    close(out[1]);
+    int out = -1;
+    pid_t pid = spawn_piped(argv, nullptr, &out);
     std::string text;
     char buf[256];
-    pollfd pfd = {out[0], POLLIN, 0};
+    pollfd pfd = {out, POLLIN, 0};
     ssize_t n = 0;
     while (std::count(text.begin(), text.end(), '\n') < (tls_port ? 2 : 1) &&
-           poll(&pfd, 1, 20000) > 0 && (n = read(out[0], buf, sizeof buf)) > 0)
+           poll(&pfd, 1, 20000) > 0 && (n = read(out, buf, sizeof buf)) > 0)
         text.append(buf, (size_t)n);
-    close(out[0]);
+    close(out);
     // Each port is the last number on its line.
     std::istringstream lines(text);
     for (int *p : {port, tls_port}) {

@@ -40,9 +40,7 @@ std::map<pid_t, int> &reaped_by_loop()
     return statuses;
 }
 
-} // namespace
-
-void exec_argv(const std::vector<std::string> &argv)
+[[noreturn]] void exec_argv(const std::vector<std::string> &argv)
 {
     std::vector<char *> args;
     for (const auto &a : argv)
@@ -51,6 +49,8 @@ void exec_argv(const std::vector<std::string> &argv)
     execv(args[0], args.data());
     _exit(127);
 }
+
+} // namespace
 
 TempDir::TempDir(bool set_env)
 {
@@ -98,37 +98,43 @@ std::string source_path(const std::string &rel)
     return std::string(dir ? dir : ".") + "/" + rel;
 }
 
-int run_program(const std::vector<std::string> &argv, const std::string &input, std::string *out)
+pid_t spawn_piped(const std::vector<std::string> &argv, int *input, int *output)
 {
-    int in_pipe[2], out_pipe[2];
-    if (pipe(in_pipe) != 0 || pipe(out_pipe) != 0)
+    int in[2] = {-1, -1}, out[2] = {-1, -1};
+    if ((input && pipe2(in, O_CLOEXEC) != 0) || (output && pipe2(out, O_CLOEXEC) != 0))
         return -1;
     pid_t pid = fork();
-    if (pid < 0)
-        return -1;
     if (pid == 0) {
-        dup2(in_pipe[0], 0);
-        dup2(out_pipe[1], 1);
-        close(in_pipe[0]);
-        close(in_pipe[1]);
-        close(out_pipe[0]);
-        close(out_pipe[1]);
+        if (input)
+            dup2(in[0], 0);
+        if (output)
+            dup2(out[1], 1);
         exec_argv(argv);
     }
-    close(in_pipe[0]);
-    close(out_pipe[1]);
-    if (!input.empty() && write(in_pipe[1], input.data(), input.size()) < 0) {
+    close(in[0]);
+    close(out[1]);
+    if (input)
+        *input = in[1];
+    if (output)
+        *output = out[0];
+    return pid;
+}
+
+int run_program(const std::vector<std::string> &argv, const std::string &input, std::string *out)
+{
+    int to = -1, from = -1;
+    pid_t pid = spawn_piped(argv, &to, &from);
+    if (!input.empty() && write(to, input.data(), input.size()) < 0) {
         // The program may not read its input; its status tells.
     }
-    close(in_pipe[1]);
+    close(to);
     std::string collected;
     char buf[4096];
-    ssize_t n;
-    while ((n = read(out_pipe[0], buf, sizeof buf)) > 0)
+    for (ssize_t n; (n = read(from, buf, sizeof buf)) > 0;)
         collected.append(buf, (size_t)n);
-    close(out_pipe[0]);
+    close(from);
     int status = 0;
-    if (waitpid(pid, &status, 0) < 0)
+    if (pid < 0 || waitpid(pid, &status, 0) < 0)
         return -1;
     if (out)
         *out = collected;
