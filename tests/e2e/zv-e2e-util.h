@@ -61,7 +61,8 @@ inline bool set_network(bool up)
 {
     return set_key("int", "memory/dnet/status", up ? "2" : "0") &&
            set_key("int", "memory/dnet/network_config", up ? "1" : "0") &&
-           set_key("string", "memory/dnet/ip", "127.0.0.1") && set_key("string", "memory/dnet/proxy", "");
+           set_key("string", "memory/dnet/ip", "127.0.0.1") &&
+           set_key("string", "memory/dnet/proxy", "");
 }
 
 // A working network and API key, the history of a temporary folder, and the server.
@@ -71,7 +72,8 @@ class E2ETest : public ::testing::Test
     void SetUp() override
     {
         ASSERT_TRUE(set_network(true));
-        ASSERT_EQ(run_program({bin_path("zv-keystore"), "set", "zuvo.tizen.api.key"}, "dev-key"), 0);
+        ASSERT_EQ(run_program({bin_path("zv-keystore"), "set", "zuvo.tizen.api.key"}, "dev-key"),
+                  0);
         ASSERT_TRUE(zv_ext_db_open());
         g_log.mark();
     }
@@ -168,7 +170,8 @@ class ControllerFixture : public E2ETest
     {
         // The application's theme extension holds the layouts of the list and edit pages.
         char *res = app_get_resource_path();
-        elm_theme_extension_add(nullptr, (std::string(res ? res : "") + "edje/zuvo-upload-custom-winset.edj").c_str());
+        elm_theme_extension_add(
+            nullptr, (std::string(res ? res : "") + "edje/zuvo-upload-custom-winset.edj").c_str());
         free(res);
         ad_.win = elm_win_add(nullptr, "zv-e2e", ELM_WIN_BASIC);
         ad_.navi = elm_naviframe_add(ad_.win);

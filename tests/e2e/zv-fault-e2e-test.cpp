@@ -57,7 +57,8 @@ class FaultE2ETest : public zv_e2e::ControllerFixture
     {
         int id = start_one(600000, {"kind=data,action=cut,bytes=200000"});
         ASSERT_TRUE(paused(id));
-        ASSERT_TRUE(server_.add_fault("kind=status&action=status&status=" + std::to_string(status)));
+        ASSERT_TRUE(
+            server_.add_fault("kind=status&action=status&status=" + std::to_string(status)));
         ad_.resume_upload(&ad_, job(id));
         ASSERT_TRUE(run_until([&] { return server_.fired("status") == 1; }, kLongWaitMs));
         ASSERT_TRUE(paused(id)) << "a refused status query leaves the job paused";
@@ -148,8 +149,8 @@ TEST_F(FaultE2ETest, HistoryLockedLongerThanTheBusyHandlerWaits)
     EXPECT_TRUE(g_log.logged("busy handler will be returned SQLITE_BUSY error"))
         << "the store met the lock and gave up";
     // Once the lock is gone the next store writes the job's current state.
-    ASSERT_TRUE(run_until([&] { return stored_rows()[id].percent == job(id)->percent; },
-                          kLongWaitMs));
+    ASSERT_TRUE(
+        run_until([&] { return stored_rows()[id].percent == job(id)->percent; }, kLongWaitMs));
     finish(id, "history locked by another process");
 }
 
@@ -163,8 +164,8 @@ TEST_F(FaultE2ETest, HistoryReplacedByAFileThatIsNotADatabase)
     ASSERT_EQ(rename(junk.c_str(), history.c_str()), 0);
     ASSERT_TRUE(server_.clear_faults());
     // The upload itself goes on to the end; the service neither stops nor loses the bytes.
-    ASSERT_TRUE(run_until([&] { return job(id)->status == ZV_UPLOAD_STATUS_COMPLETED; },
-                          kLongWaitMs));
+    ASSERT_TRUE(
+        run_until([&] { return job(id)->status == ZV_UPLOAD_STATUS_COMPLETED; }, kLongWaitMs));
     expect_identical(id, file_);
 }
 

@@ -141,8 +141,10 @@ TEST_F(CtrlE2ETest, BackgroundCompletionOfTheLastJobEndsTheProcess)
     expect_identical(ids[1], b);
 }
 
-
-void on_transition(void *data, Evas_Object *, void *) { *static_cast<bool *>(data) = true; }
+void on_transition(void *data, Evas_Object *, void *)
+{
+    *static_cast<bool *>(data) = true;
+}
 
 // The first visible widget of a type on the window's canvas.
 Evas_Object *find_widget(Evas_Object *win, const char *type)
@@ -163,7 +165,8 @@ Evas_Object *find_widget(Evas_Object *win, const char *type)
 TEST_F(CtrlE2ETest, StressOfThirtyJobsWithEventsAtRandomMoments)
 {
     const char *seed_env = getenv("ZV_STRESS_SEED");
-    const unsigned seed = seed_env ? static_cast<unsigned>(strtoul(seed_env, nullptr, 10)) : 20261123u;
+    const unsigned seed =
+        seed_env ? static_cast<unsigned>(strtoul(seed_env, nullptr, 10)) : 20261123u;
     printf("stress seed %u (ZV_STRESS_SEED=%u replays this run)\n", seed, seed);
     std::mt19937 rng(seed);
 
@@ -171,8 +174,8 @@ TEST_F(CtrlE2ETest, StressOfThirtyJobsWithEventsAtRandomMoments)
     std::vector<std::string> files;
     for (int i = 0; i < 30; ++i)
         files.push_back(video("v" + std::to_string(i) + ".mp4", 150000 + 7919 * i, 100 + i));
-    std::vector<int> ids = zv_e2e::record(std::vector<std::string>(files.begin(), files.begin() + 20),
-                                          "Stress");
+    std::vector<int> ids =
+        zv_e2e::record(std::vector<std::string>(files.begin(), files.begin() + 20), "Stress");
     ASSERT_EQ(ids.size(), 20u);
     start_controller();
     launch();
@@ -271,8 +274,8 @@ TEST_F(CtrlE2ETest, StressOfThirtyJobsWithEventsAtRandomMoments)
                 all.push_back(static_cast<UploadItem *>(l->data));
             ASSERT_EQ(delete_in_edit_mode(pick(all)), "");
         } else if (k == 9 && !second_launch) {
-            std::vector<int> more = zv_e2e::record(
-                std::vector<std::string>(files.begin() + 20, files.end()), "Stress");
+            std::vector<int> more =
+                zv_e2e::record(std::vector<std::string>(files.begin() + 20, files.end()), "Stress");
             ASSERT_EQ(more.size(), 10u);
             ids.insert(ids.end(), more.begin(), more.end());
             launch();
@@ -312,7 +315,8 @@ TEST_F(CtrlE2ETest, StressOfThirtyJobsWithEventsAtRandomMoments)
         if (deleted.count(ids[i]))
             continue;
         Upload u = upload_of(ids[i]);
-        EXPECT_TRUE(u.complete && zv_test::read_file(u.path) == contents_[files[i]]) << "server copy of " << files[i];
+        EXPECT_TRUE(u.complete && zv_test::read_file(u.path) == contents_[files[i]])
+            << "server copy of " << files[i];
     }
     // The server refuses (416) a data upload that starts elsewhere than its byte count: two
     // requests of one job crossed, or a data upload went out from an old offset.
@@ -322,7 +326,8 @@ TEST_F(CtrlE2ETest, StressOfThirtyJobsWithEventsAtRandomMoments)
         std::string history;
         for (const Logged &q : server_.requests_of(r.upload_id))
             history += q.line + "\n";
-        ADD_FAILURE() << "a data upload was refused for its range; the upload's requests:\n" << history;
+        ADD_FAILURE() << "a data upload was refused for its range; the upload's requests:\n"
+                      << history;
     }
 }
 
