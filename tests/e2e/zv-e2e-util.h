@@ -30,7 +30,7 @@ using zv_upload_test::stored_rows;
 constexpr int kLongWaitMs = 60000;
 
 // The log of this process, in one file with marks.
-inline zv_test::LogFile g_log;
+inline zv_test::LogFile g_test_log;
 
 // Records the files with the companion client; their history ids in order, empty on failure.
 inline std::vector<int> record(const std::vector<std::string> &files, const std::string &title)
@@ -75,7 +75,7 @@ class E2ETest : public ::testing::Test
         ASSERT_EQ(run_program({bin_path("zv-keystore"), "set", "zuvo.tizen.api.key"}, "dev-key"),
                   0);
         ASSERT_TRUE(zv_ext_db_open());
-        g_log.mark();
+        g_test_log.mark();
     }
     void TearDown() override { zv_ext_db_close(); }
 

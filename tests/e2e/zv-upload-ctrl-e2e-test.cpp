@@ -26,7 +26,7 @@ using zv_e2e::Upload;
 using zv_upload_test::run_until;
 using zv_upload_test::stored_rows;
 
-using zv_e2e::g_log;
+using zv_e2e::g_test_log;
 using zv_e2e::kLongWaitMs;
 
 class CtrlE2ETest : public zv_e2e::ControllerFixture
@@ -57,7 +57,7 @@ TEST_F(CtrlE2ETest, NetworkEventPausesRunningUploadsAndUploadAgainContinues)
     EXPECT_EQ(job(ids[1])->status, ZV_UPLOAD_STATUS_PAUSED);
     EXPECT_EQ(job(waiting)->status, ZV_UPLOAD_STATUS_WAITING);
     EXPECT_EQ(stored_rows()[waiting].status, ZV_UPLOAD_STATUS_WAITING);
-    EXPECT_FALSE(g_log.logged("zv_request_upload_pause fail"));
+    EXPECT_FALSE(g_test_log.logged("zv_request_upload_pause fail"));
 
     ASSERT_TRUE(server_.clear_faults());
     for (int id : ids)
@@ -136,7 +136,7 @@ TEST_F(CtrlE2ETest, BackgroundCompletionOfTheLastJobEndsTheProcess)
     auto rows = stored_rows();
     EXPECT_EQ(rows[ids[0]].status, ZV_UPLOAD_STATUS_COMPLETED);
     EXPECT_EQ(rows[ids[1]].status, ZV_UPLOAD_STATUS_COMPLETED);
-    EXPECT_TRUE(g_log.logged("Not exist running job"));
+    EXPECT_TRUE(g_test_log.logged("Not exist running job"));
     expect_identical(ids[0], a);
     expect_identical(ids[1], b);
 }
