@@ -7,6 +7,7 @@
 #include <app.h>
 #include <gtest/gtest.h>
 
+#include <algorithm>
 #include <map>
 #include <random>
 #include <sstream>
@@ -102,17 +103,16 @@ class E2ETest : public ::testing::Test
         zv_test::write_file(path, data);
         return path;
     }
+    // Whether every row of ids has this status (now, or within timeout_ms).
+    bool rows_in(const std::vector<int> &ids, int status)
+    {
+        auto rows = stored_rows();
+        return std::all_of(ids.begin(), ids.end(),
+                           [&](int id) { return rows[id].status == status; });
+    }
     bool rows_are(const std::vector<int> &ids, int status, int timeout_ms = kLongWaitMs)
     {
-        return zv_upload_test::run_until(
-            [&] {
-                auto rows = stored_rows();
-                for (int id : ids)
-                    if (rows[id].status != status)
-                        return false;
-                return true;
-            },
-            timeout_ms);
+        return zv_upload_test::run_until([&] { return rows_in(ids, status); }, timeout_ms);
     }
     // The server's upload of the row, once the row has its upload address.
     Upload upload_of(int historyid) { return server_.upload_of_url(stored_rows()[historyid].url); }
