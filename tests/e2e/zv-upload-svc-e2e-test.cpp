@@ -91,46 +91,6 @@ class ServiceE2ETest : public E2ETest
     std::vector<std::unique_ptr<Child>> services_;
 };
 
-TEST_F(ServiceE2ETest, TwoRecordedFilesUploadSideBySide)
-{
-    ASSERT_TRUE(start_server({"kind=data,action=throttle,rate=1000000,times=0"}));
-    std::string a = video("a.mp4", 2500000, 1), b = video("b.mp4", 2000000, 2);
-    std::vector<int> ids = record({a, b}, "Holiday");
-    ASSERT_EQ(ids.size(), 2u);
-    Child &svc = start_service();
-    EXPECT_TRUE(wait_for([&] { return mid_upload(ids[0]) && mid_upload(ids[1]); }, kLongWaitMs))
-        << "both files are on their way at once";
-    ASSERT_TRUE(rows_are(ids, ZV_UPLOAD_STATUS_COMPLETED));
-    auto rows = stored_rows();
-    for (int id : ids) {
-        EXPECT_EQ(rows[id].percent, 100);
-        EXPECT_EQ(rows[id].url, upload_of(id).url);
-        EXPECT_NE(rows[id].url.find("/resumable/uploads/"), std::string::npos);
-    }
-    expect_identical(ids[0], a);
-    expect_identical(ids[1], b);
-    std::string run = dir_.file("run");
-    ASSERT_TRUE(
-        wait_for([&] { return notification(run, "zuvo_ongoing_noti").empty(); }, kLongWaitMs));
-    auto complete = notification(run, "zuvo_complete_noti");
-    EXPECT_NE(complete["title"].find('2'), std::string::npos) << complete["title"];
-    EXPECT_FALSE(complete["content"].empty());
-
-    svc.signal(SIGTERM);
-    ASSERT_TRUE(svc.wait_exit(kLongWaitMs));
-    // Neither the token nor the API key reaches the log (libcurl's verbose lines included)
-    // or any file the service wrote: the history, the tray, the keys of the runtime folder.
-    ASSERT_TRUE(logged("Authorization: ****")) << "the verbose lines are in the log, masked";
-    std::vector<std::string> written = {log_path(), getenv("ZV_HISTORY_DB")};
-    for (const auto &entry : std::filesystem::recursive_directory_iterator(run))
-        if (entry.is_regular_file())
-            written.push_back(entry.path().string());
-    for (const std::string &file : written)
-        for (const char *secret : {"dev-token", "dev-key"})
-            EXPECT_EQ(zv_test::read_file(file).find(secret), std::string::npos)
-                << secret << " in " << file;
-}
-
 TEST_F(ServiceE2ETest, KilledMidUploadResumesWithStatusQueryAtNextStart)
 {
     ASSERT_TRUE(start_server({"kind=data,action=throttle,rate=300000,times=0"}));
@@ -237,8 +197,8 @@ TEST_F(LargeFileE2ETest, VideoPastTwoGiBSurvivesAKillAndArrivesWhole)
 }
 
 // Under an open-file limit of 128 (soft and hard), far below what 200 jobs at once would hold,
-// the batch completes: every copy byte-identical, no descriptor missing anywhere, and the tray
-// ends with the completion alone.
+// the batch completes: every copy byte-identical, no descriptor missing anywhere, the tray
+// ends with the completion alone, and no secret is left anywhere.
 TEST_F(ServiceE2ETest, BatchPastTheOpenFileLimitCompletes)
 {
     ASSERT_TRUE(start_server());
@@ -249,13 +209,15 @@ TEST_F(ServiceE2ETest, BatchPastTheOpenFileLimitCompletes)
             zv_upload_test::add_row(id, ZV_UPLOAD_STATUS_READY, 1.7e9 + id, file.c_str(), "Batch"));
         ids.push_back(id);
     }
-    start_service(kBatch, 128);
+    Child &svc = start_service(kBatch, 128);
     ASSERT_TRUE(rows_are(ids, ZV_UPLOAD_STATUS_COMPLETED, 4 * kLongWaitMs));
     std::map<std::string, Upload> by_url;
     for (const Upload &u : server_.uploads())
         by_url[u.url] = u;
     auto rows = stored_rows();
     for (int id : ids) {
+        EXPECT_EQ(rows[id].percent, 100);
+        EXPECT_NE(rows[id].url.find("/resumable/uploads/"), std::string::npos);
         const Upload &u = by_url[rows[id].url];
         ASSERT_TRUE(u.complete) << id;
         EXPECT_TRUE(zv_test::read_file(u.path) ==
@@ -266,7 +228,23 @@ TEST_F(ServiceE2ETest, BatchPastTheOpenFileLimitCompletes)
     std::string run = dir_.file("run");
     ASSERT_TRUE(
         wait_for([&] { return notification(run, "zuvo_ongoing_noti").empty(); }, kLongWaitMs));
-    EXPECT_NE(notification(run, "zuvo_complete_noti")["title"].find("200"), std::string::npos);
+    auto complete = notification(run, "zuvo_complete_noti");
+    EXPECT_NE(complete["title"].find("200"), std::string::npos) << complete["title"];
+    EXPECT_FALSE(complete["content"].empty());
+
+    svc.signal(SIGTERM);
+    ASSERT_TRUE(svc.wait_exit(kLongWaitMs));
+    // Neither the token nor the API key reaches the log (libcurl's verbose lines included)
+    // or any file the service wrote: the history, the tray, the keys of the runtime folder.
+    ASSERT_TRUE(logged("Authorization: ****")) << "the verbose lines are in the log, masked";
+    std::vector<std::string> written = {log_path(), getenv("ZV_HISTORY_DB")};
+    for (const auto &entry : std::filesystem::recursive_directory_iterator(run))
+        if (entry.is_regular_file())
+            written.push_back(entry.path().string());
+    for (const std::string &file : written)
+        for (const char *secret : {"dev-token", "dev-key"})
+            EXPECT_EQ(zv_test::read_file(file).find(secret), std::string::npos)
+                << secret << " in " << file;
 }
 
 // A failure of the server or of the settings: the row ends as expected and the log says why.
