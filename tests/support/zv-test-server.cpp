@@ -182,14 +182,6 @@ int DevServer::stop()
     return status >= 0 && WIFEXITED(status) ? WEXITSTATUS(status) : -1;
 }
 
-Env DevServer::env() const
-{
-    return {{"ZV_UPLOAD_HOST", host()},
-            {"ZV_DATA_HOST", host()},
-            {"ZV_ACCOUNT_HOST", host()},
-            {"ZV_TOKEN_HOST", host()}};
-}
-
 std::vector<Logged> DevServer::requests() const
 {
     std::vector<Logged> all;
@@ -206,16 +198,6 @@ std::vector<Logged> DevServer::requests_of(const std::string &upload_id) const
         if (r.upload_id == upload_id)
             list.push_back(r);
     return list;
-}
-
-bool DevServer::add_fault(const std::string &query) const
-{
-    return http("POST", url("/_admin/fault?" + query)).status == 201;
-}
-
-bool DevServer::clear_faults() const
-{
-    return http("DELETE", url("/_admin/faults")).status == 200;
 }
 
 long long DevServer::fired(const std::string &action) const

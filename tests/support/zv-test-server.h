@@ -73,7 +73,11 @@ public:
     std::string tls_host() const { return "127.0.0.1:" + std::to_string(tls_port_); }
     std::string url(const std::string &path) const { return "http://" + host() + path; }
     // ZV_UPLOAD_HOST, ZV_DATA_HOST, ZV_ACCOUNT_HOST and ZV_TOKEN_HOST naming this server.
-    Env env() const;
+    Env env() const
+    {
+        return {{"ZV_UPLOAD_HOST", host()}, {"ZV_DATA_HOST", host()}, {"ZV_ACCOUNT_HOST", host()},
+                {"ZV_TOKEN_HOST", host()}};
+    }
     std::string log_path() const { return dir_ + "/requests.log"; }
     std::string stored(const std::string &upload_id) const
     {
@@ -83,8 +87,11 @@ public:
     std::vector<Logged> requests() const;
     std::vector<Logged> requests_of(const std::string &upload_id) const;
 
-    bool add_fault(const std::string &query) const;
-    bool clear_faults() const;
+    bool add_fault(const std::string &query) const
+    {
+        return http("POST", url("/_admin/fault?" + query)).status == 201;
+    }
+    bool clear_faults() const { return http("DELETE", url("/_admin/faults")).status == 200; }
     // How many requests the rules with this action acted on.
     long long fired(const std::string &action) const;
     std::vector<Upload> uploads() const;
