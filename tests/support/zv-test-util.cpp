@@ -40,7 +40,9 @@ std::map<pid_t, int> &reaped_by_loop()
     return statuses;
 }
 
-[[noreturn]] void exec_argv(const std::vector<std::string> &argv)
+} // namespace
+
+void exec_argv(const std::vector<std::string> &argv)
 {
     std::vector<char *> args;
     for (const auto &a : argv)
@@ -49,8 +51,6 @@ std::map<pid_t, int> &reaped_by_loop()
     execv(args[0], args.data());
     _exit(127);
 }
-
-} // namespace
 
 TempDir::TempDir(bool set_env)
 {

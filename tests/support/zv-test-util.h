@@ -38,6 +38,9 @@ std::string bin_path(const std::string &program);
 // Path below the source tree.
 std::string source_path(const std::string &rel);
 
+// In a forked child: executes argv (argv[0] a path), or exits 127.
+[[noreturn]] void exec_argv(const std::vector<std::string> &argv);
+
 // Starts argv (argv[0] a path) with its standard input (*input: the write end) and output
 // (*output: the read end) on pipes, or inherited where null; the pid, or -1.
 pid_t spawn_piped(const std::vector<std::string> &argv, int *input, int *output);
