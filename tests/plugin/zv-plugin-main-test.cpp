@@ -44,15 +44,10 @@ struct Inbox {
     std::vector<Answer> answers;
     std::vector<int> percents;
 
-    size_t count()
+    std::vector<Answer> got()
     {
         std::lock_guard<std::mutex> lock(mutex);
-        return answers.size();
-    }
-    Answer last()
-    {
-        std::lock_guard<std::mutex> lock(mutex);
-        return answers.back();
+        return answers;
     }
 };
 
@@ -133,10 +128,10 @@ protected:
     // Issues the request and waits for its answer.
     Answer send(int (*request)(ServiceRequest *), const Handle &handle)
     {
-        const size_t before = inbox_.count();
+        const size_t before = inbox_.got().size();
         EXPECT_EQ(request(handle.h), 0);
-        EXPECT_TRUE(wait_for([&] { return inbox_.count() > before; }, 60000));
-        return inbox_.count() > before ? inbox_.last() : Answer{1, 1, 1, std::nullopt};
+        EXPECT_TRUE(wait_for([&] { return inbox_.got().size() > before; }, 60000));
+        return inbox_.got().size() > before ? inbox_.got().back() : Answer{1, 1, 1, std::nullopt};
     }
     void set_meta(const Handle &meta, const char *token = TOKEN)
     {
@@ -281,7 +276,8 @@ TEST_F(ClientTest, MetaUploadSendsHeadersAndEntryInOrder)
     } cases[] = {
         {0, 0, 0, nullptr, nullptr, nullptr,
          {">Clip &amp; co</media:title>", ">Film</media:category>", "permission=\"allowed\""},
-         {"<zv:private/>", "<georss:where>", "<media:description", "<media:keywords", "<zv:location"}},
+         {"<zv:private/>", "<georss:where>", "<media:description", "<media:keywords",
+          "<zv:location"}},
         {1, 0, 0, nullptr, nullptr, nullptr, {"permission=\"denied\""}, {"<zv:private/>"}},
         {2, 0, 0, "A day", "sea, sand", nullptr,
          {"<zv:private/>", "permission=\"denied\"", ">A day</media:description>",
@@ -450,9 +446,9 @@ TEST_F(ClientTest, DataUploadPastFourGiBGoesOnBehindTheStatusAnswer)
     char header[] = "HTTP/1.1 308 Resume Incomplete\r\nRange: bytes=0-2999999999\r\n\r\n";
     TransferResponse answer = {308, header, nullptr};
     _zv_request_curl_resp_cb(0, &answer, query.h);
-    ASSERT_EQ(inbox_.last().value, "2999999999");
+    ASSERT_EQ(inbox_.got().back().value, "2999999999");
 
-    data_upload(url, std::stoll(*inbox_.last().value), video);
+    data_upload(url, std::stoll(*inbox_.got().back().value), video);
     const Logged put = server_->requests().back();
     EXPECT_EQ(put.header("Content-Range"), "bytes 3000000000-4999999999/5000000000");
     EXPECT_EQ(put.header("Content-Length"), "2000000000");
@@ -479,10 +475,10 @@ TEST_F(ClientTest, PausedUploadResumesAndFreedUploadNeverAnswers)
     }));
     EXPECT_EQ(zv_request_upload_pause(data.h), 0);
     EXPECT_EQ(zv_request_upload_resume(data.h), 0);
-    ASSERT_TRUE(wait_for([&] { return inbox_.count() >= 3; }, 60000));
-    EXPECT_EQ(inbox_.last().http_code, 201);
-    EXPECT_EQ(inbox_.count(), 3u); // two metadata answers and this one
-    const std::string etag = inbox_.last().value.value_or("  ");
+    ASSERT_TRUE(wait_for([&] { return inbox_.got().size() >= 3; }, 60000));
+    EXPECT_EQ(inbox_.got().back().http_code, 201);
+    EXPECT_EQ(inbox_.got().size(), 3u); // two metadata answers and this one
+    const std::string etag = inbox_.got().back().value.value_or("  ");
     EXPECT_EQ(server_->stored(etag.substr(2, etag.size() - 3)), read_file(clip_));
     EXPECT_EQ(zv_request_upload_cancel(data.h), 0);
 }
