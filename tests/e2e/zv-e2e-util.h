@@ -7,6 +7,7 @@
 #include <app.h>
 #include <gtest/gtest.h>
 
+#include <algorithm>
 #include <map>
 #include <random>
 #include <sstream>
@@ -30,7 +31,7 @@ using zv_upload_test::stored_rows;
 constexpr int kLongWaitMs = 60000;
 
 // The log of this process, in one file with marks.
-inline zv_test::LogFile g_log;
+inline zv_test::LogFile g_test_log;
 
 // Records the files with the companion client; their history ids in order, empty on failure.
 inline std::vector<int> record(const std::vector<std::string> &files, const std::string &title)
@@ -61,7 +62,8 @@ inline bool set_network(bool up)
 {
     return set_key("int", "memory/dnet/status", up ? "2" : "0") &&
            set_key("int", "memory/dnet/network_config", up ? "1" : "0") &&
-           set_key("string", "memory/dnet/ip", "127.0.0.1") && set_key("string", "memory/dnet/proxy", "");
+           set_key("string", "memory/dnet/ip", "127.0.0.1") &&
+           set_key("string", "memory/dnet/proxy", "");
 }
 
 // A working network and API key, the history of a temporary folder, and the server.
@@ -71,9 +73,10 @@ class E2ETest : public ::testing::Test
     void SetUp() override
     {
         ASSERT_TRUE(set_network(true));
-        ASSERT_EQ(run_program({bin_path("zv-keystore"), "set", "zuvo.tizen.api.key"}, "dev-key"), 0);
+        ASSERT_EQ(run_program({bin_path("zv-keystore"), "set", "zuvo.tizen.api.key"}, "dev-key"),
+                  0);
         ASSERT_TRUE(zv_ext_db_open());
-        g_log.mark();
+        g_test_log.mark();
     }
     void TearDown() override { zv_ext_db_close(); }
 
@@ -100,17 +103,16 @@ class E2ETest : public ::testing::Test
         zv_test::write_file(path, data);
         return path;
     }
+    // Whether every row of ids has this status (now, or within timeout_ms).
+    bool rows_in(const std::vector<int> &ids, int status)
+    {
+        auto rows = stored_rows();
+        return std::all_of(ids.begin(), ids.end(),
+                           [&](int id) { return rows[id].status == status; });
+    }
     bool rows_are(const std::vector<int> &ids, int status, int timeout_ms = kLongWaitMs)
     {
-        return zv_upload_test::run_until(
-            [&] {
-                auto rows = stored_rows();
-                for (int id : ids)
-                    if (rows[id].status != status)
-                        return false;
-                return true;
-            },
-            timeout_ms);
+        return zv_upload_test::run_until([&] { return rows_in(ids, status); }, timeout_ms);
     }
     // The server's upload of the row, once the row has its upload address.
     Upload upload_of(int historyid) { return server_.upload_of_url(stored_rows()[historyid].url); }
@@ -168,7 +170,8 @@ class ControllerFixture : public E2ETest
     {
         // The application's theme extension holds the layouts of the list and edit pages.
         char *res = app_get_resource_path();
-        elm_theme_extension_add(nullptr, (std::string(res ? res : "") + "edje/zuvo-upload-custom-winset.edj").c_str());
+        elm_theme_extension_add(
+            nullptr, (std::string(res ? res : "") + "edje/zuvo-upload-custom-winset.edj").c_str());
         free(res);
         ad_.win = elm_win_add(nullptr, "zv-e2e", ELM_WIN_BASIC);
         ad_.navi = elm_naviframe_add(ad_.win);

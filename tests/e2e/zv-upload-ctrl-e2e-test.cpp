@@ -1,35 +1,19 @@
 // End-to-end tests of the controller in this process, against the development server: the
-// network event written with zv-vconf, upload-again from the badge's operation, and the end
-// of the process in the background. The controller runs with a real window and list view,
-// the service client and its worker thread, and the history file of a temporary folder.
-#include <Elementary.h>
-#include <app.h>
-#include <gtest/gtest.h>
-
-#include <fstream>
-#include <map>
+// network event written with zv-vconf, upload-again from the badge's operation, the end of
+// the process in the background, and all of it at random moments.
 #include <random>
 #include <set>
-#include <string>
-#include <vector>
 
 #include "zv-e2e-util.h"
-#include "zv-ext-network.h"
-#include "zv-upload-ctrl.h"
 #include "zv-upload-view.h"
 
 namespace
 {
 
-using zv_e2e::Logged;
-using zv_e2e::Upload;
+using namespace zv_e2e;
 using zv_upload_test::run_until;
-using zv_upload_test::stored_rows;
 
-using zv_e2e::g_log;
-using zv_e2e::kLongWaitMs;
-
-class CtrlE2ETest : public zv_e2e::ControllerFixture
+class CtrlE2ETest : public ControllerFixture
 {
 };
 
@@ -38,26 +22,25 @@ TEST_F(CtrlE2ETest, NetworkEventPausesRunningUploadsAndUploadAgainContinues)
     // The third metadata upload stalls: its job is still waiting at the network event.
     ASSERT_TRUE(start_server({"kind=data,action=throttle,rate=100000,times=0",
                               "kind=meta,action=stall,seconds=60,nth=3"}));
-    std::string a = video("a.mp4", 3000000, 11);
-    std::string b = video("b.mp4", 2500000, 12);
-    std::vector<int> ids = zv_e2e::record({a, b}, "Running");
+    std::string a = video("a.mp4", 3000000, 11), b = video("b.mp4", 2500000, 12);
+    std::vector<int> ids = record({a, b}, "Running");
     ASSERT_EQ(ids.size(), 2u);
     start_controller();
     launch();
     ASSERT_TRUE(run_until([&] { return mid_upload(ids[0]) && mid_upload(ids[1]); }, kLongWaitMs));
     ASSERT_TRUE(rows_are(ids, ZV_UPLOAD_STATUS_UPLOADING));
 
-    int waiting = zv_e2e::record({video("c.mp4", 100000, 13)}, "Waiting").at(0);
+    int waiting = record({video("c.mp4", 100000, 13)}, "Waiting").at(0);
     launch();
     ASSERT_TRUE(run_until([&] { return server_.fired("stall") == 1; }, kLongWaitMs));
 
-    ASSERT_TRUE(zv_e2e::set_key("int", "memory/dnet/status", "2"));
+    ASSERT_TRUE(set_key("int", "memory/dnet/status", "2"));
     ASSERT_TRUE(rows_are(ids, ZV_UPLOAD_STATUS_PAUSED));
     EXPECT_EQ(job(ids[0])->status, ZV_UPLOAD_STATUS_PAUSED);
     EXPECT_EQ(job(ids[1])->status, ZV_UPLOAD_STATUS_PAUSED);
     EXPECT_EQ(job(waiting)->status, ZV_UPLOAD_STATUS_WAITING);
     EXPECT_EQ(stored_rows()[waiting].status, ZV_UPLOAD_STATUS_WAITING);
-    EXPECT_FALSE(g_log.logged("zv_request_upload_pause fail"));
+    EXPECT_FALSE(g_test_log.logged("zv_request_upload_pause fail"));
 
     ASSERT_TRUE(server_.clear_faults());
     for (int id : ids)
@@ -76,7 +59,7 @@ TEST_F(CtrlE2ETest, ResumedUploadWithOneReadLeftMovesItsBarToTheEnd)
 {
     ASSERT_TRUE(start_server({"kind=data,action=cut,bytes=200000"}));
     std::string a = video("a.mp4", 600000, 31);
-    int id = zv_e2e::record({a}, "Resumed").at(0);
+    int id = record({a}, "Resumed").at(0);
     start_controller();
     launch();
     ASSERT_TRUE(rows_are({id}, ZV_UPLOAD_STATUS_PAUSED));
@@ -120,9 +103,8 @@ TEST_F(CtrlE2ETest, ResumedUploadWithOneReadLeftMovesItsBarToTheEnd)
 TEST_F(CtrlE2ETest, BackgroundCompletionOfTheLastJobEndsTheProcess)
 {
     ASSERT_TRUE(start_server({"kind=data,action=throttle,rate=400000,times=0"}));
-    std::string a = video("a.mp4", 1200000, 21);
-    std::string b = video("b.mp4", 1600000, 22);
-    std::vector<int> ids = zv_e2e::record({a, b}, "Background");
+    std::string a = video("a.mp4", 1200000, 21), b = video("b.mp4", 1600000, 22);
+    std::vector<int> ids = record({a, b}, "Background");
     ASSERT_EQ(ids.size(), 2u);
     start_controller();
     launch();
@@ -133,16 +115,16 @@ TEST_F(CtrlE2ETest, BackgroundCompletionOfTheLastJobEndsTheProcess)
     bool ended = false;
     run_until([] { return false; }, kLongWaitMs, &ended);
     ASSERT_TRUE(ended) << "the last completion ends the main loop";
-    auto rows = stored_rows();
-    EXPECT_EQ(rows[ids[0]].status, ZV_UPLOAD_STATUS_COMPLETED);
-    EXPECT_EQ(rows[ids[1]].status, ZV_UPLOAD_STATUS_COMPLETED);
-    EXPECT_TRUE(g_log.logged("Not exist running job"));
+    EXPECT_TRUE(rows_in(ids, ZV_UPLOAD_STATUS_COMPLETED));
+    EXPECT_TRUE(g_test_log.logged("Not exist running job"));
     expect_identical(ids[0], a);
     expect_identical(ids[1], b);
 }
 
-
-void on_transition(void *data, Evas_Object *, void *) { *static_cast<bool *>(data) = true; }
+void on_transition(void *data, Evas_Object *, void *)
+{
+    *static_cast<bool *>(data) = true;
+}
 
 // The first visible widget of a type on the window's canvas.
 Evas_Object *find_widget(Evas_Object *win, const char *type)
@@ -163,26 +145,24 @@ Evas_Object *find_widget(Evas_Object *win, const char *type)
 TEST_F(CtrlE2ETest, StressOfThirtyJobsWithEventsAtRandomMoments)
 {
     const char *seed_env = getenv("ZV_STRESS_SEED");
-    const unsigned seed = seed_env ? static_cast<unsigned>(strtoul(seed_env, nullptr, 10)) : 20261123u;
+    const unsigned seed = seed_env ? unsigned(strtoul(seed_env, nullptr, 10)) : 20261123u;
     printf("stress seed %u (ZV_STRESS_SEED=%u replays this run)\n", seed, seed);
     std::mt19937 rng(seed);
-
     ASSERT_TRUE(start_server({"kind=data,action=throttle,rate=250000,times=0"}));
     std::vector<std::string> files;
     for (int i = 0; i < 30; ++i)
         files.push_back(video("v" + std::to_string(i) + ".mp4", 150000 + 7919 * i, 100 + i));
-    std::vector<int> ids = zv_e2e::record(std::vector<std::string>(files.begin(), files.begin() + 20),
-                                          "Stress");
+    std::vector<int> ids = record({files.begin(), files.begin() + 20}, "Stress");
     ASSERT_EQ(ids.size(), 20u);
     start_controller();
     launch();
 
-    std::set<int> deleted;
+    // The jobs in a status (every job for -1), and one of them at random.
     auto jobs_in = [&](int status) {
         std::vector<UploadItem *> found;
         for (GList *l = ad_.job_list; l; l = l->next) {
             auto *job = static_cast<UploadItem *>(l->data);
-            if (job && job->status == status)
+            if (job && (status < 0 || job->status == status))
                 found.push_back(job);
         }
         return found;
@@ -190,10 +170,9 @@ TEST_F(CtrlE2ETest, StressOfThirtyJobsWithEventsAtRandomMoments)
     auto pick = [&](const std::vector<UploadItem *> &from) {
         return from[std::uniform_int_distribution<size_t>(0, from.size() - 1)(rng)];
     };
-    // Remove one job the way a user does: the more key's menu, its row, Done, and Stop when
-    // the question comes.
-    // Remove one job the way a user does: the more key's menu, its row, Done, and Stop when
+    // Removes one job the way a user does: the more key's menu, its row, Done, and Stop when
     // the question comes. What went wrong, or nothing.
+    std::set<int> deleted;
     auto delete_in_edit_mode = [&](UploadItem *job) -> std::string {
         int historyid = job->historyid;
         // The naviframe pops no page while it is still sliding in.
@@ -229,31 +208,19 @@ TEST_F(CtrlE2ETest, StressOfThirtyJobsWithEventsAtRandomMoments)
             return "the edit page stays";
         return "";
     };
-
-    // A network event at the moment the metadata answers of new jobs arrive: the first of
-    // them turns its job UPLOADING, and the event comes before any upload message is read.
-    auto network_event_at_metadata_answers = [&](const std::vector<int> &fresh) {
-        std::set<int> waiting(fresh.begin(), fresh.end());
-        run_until(
-            [&] {
-                for (int id : fresh) {
-                    UploadItem *job = this->job(id);
-                    if (job && job->status == ZV_UPLOAD_STATUS_UPLOADING)
-                        return true;
-                }
-                return false;
-            },
-            5000);
-        _zv_upload_ctrl_net_status_cb(1, &ad_);
+    std::vector<int> more;
+    auto launch_the_rest = [&] {
+        more = record({files.begin() + 20, files.end()}, "Stress");
+        ids.insert(ids.end(), more.begin(), more.end());
+        launch();
     };
 
     std::uniform_int_distribution<int> pause_ms(20, 150), kind(0, 11);
-    bool second_launch = false;
     for (int step = 0; step < 60; ++step) {
         run_until([] { return false; }, pause_ms(rng));
         int k = kind(rng);
         if (k <= 1) {
-            ASSERT_TRUE(zv_e2e::set_key("int", "memory/dnet/status", "2"));
+            ASSERT_TRUE(set_key("int", "memory/dnet/status", "2"));
         } else if (k == 10 && !jobs_in(ZV_UPLOAD_STATUS_PAUSED).empty()) {
             // A tap on the badge while the status query of upload again is out.
             UploadItem *job = pick(jobs_in(ZV_UPLOAD_STATUS_PAUSED));
@@ -265,27 +232,27 @@ TEST_F(CtrlE2ETest, StressOfThirtyJobsWithEventsAtRandomMoments)
             ad_.pause_upload(&ad_, pick(jobs_in(ZV_UPLOAD_STATUS_UPLOADING)));
         } else if (k <= 7 && !jobs_in(ZV_UPLOAD_STATUS_PAUSED).empty()) {
             ad_.resume_upload(&ad_, pick(jobs_in(ZV_UPLOAD_STATUS_PAUSED)));
-        } else if (k == 8 && deleted.size() < 4 && g_list_length(ad_.job_list) > 1) {
-            std::vector<UploadItem *> all;
-            for (GList *l = ad_.job_list; l; l = l->next)
-                all.push_back(static_cast<UploadItem *>(l->data));
-            ASSERT_EQ(delete_in_edit_mode(pick(all)), "");
-        } else if (k == 9 && !second_launch) {
-            std::vector<int> more = zv_e2e::record(
-                std::vector<std::string>(files.begin() + 20, files.end()), "Stress");
+        } else if (k == 8 && deleted.size() < 4 && jobs_in(-1).size() > 1) {
+            ASSERT_EQ(delete_in_edit_mode(pick(jobs_in(-1))), "");
+        } else if (k == 9 && more.empty()) {
+            launch_the_rest();
             ASSERT_EQ(more.size(), 10u);
-            ids.insert(ids.end(), more.begin(), more.end());
-            launch();
-            second_launch = true;
-            network_event_at_metadata_answers(more);
+            // A network event at the moment the metadata answers of the new jobs arrive: the
+            // first of them turns its job UPLOADING, and the event comes before any upload
+            // message is read.
+            run_until(
+                [&] {
+                    for (int id : more)
+                        if (job(id) && job(id)->status == ZV_UPLOAD_STATUS_UPLOADING)
+                            return true;
+                    return false;
+                },
+                5000);
+            _zv_upload_ctrl_net_status_cb(1, &ad_);
         }
     }
-    if (!second_launch) {
-        std::vector<int> more =
-            zv_e2e::record(std::vector<std::string>(files.begin() + 20, files.end()), "Stress");
-        ids.insert(ids.end(), more.begin(), more.end());
-        launch();
-    }
+    if (more.empty())
+        launch_the_rest();
 
     // The rest at full speed: paused jobs are resumed until every remaining one completes.
     ASSERT_TRUE(server_.clear_faults());
@@ -297,23 +264,15 @@ TEST_F(CtrlE2ETest, StressOfThirtyJobsWithEventsAtRandomMoments)
         [&] {
             for (UploadItem *job : jobs_in(ZV_UPLOAD_STATUS_PAUSED))
                 ad_.resume_upload(&ad_, job);
-            auto rows = stored_rows();
-            for (int id : kept)
-                if (rows[id].status != ZV_UPLOAD_STATUS_COMPLETED)
-                    return false;
-            return true;
+            return rows_in(kept, ZV_UPLOAD_STATUS_COMPLETED);
         },
         3 * kLongWaitMs));
-
     auto rows = stored_rows();
     for (int id : deleted)
         EXPECT_EQ(rows.count(id), 0u) << "row " << id << " was deleted in edit mode";
-    for (size_t i = 0; i < ids.size(); ++i) {
-        if (deleted.count(ids[i]))
-            continue;
-        Upload u = upload_of(ids[i]);
-        EXPECT_TRUE(u.complete && zv_test::read_file(u.path) == contents_[files[i]]) << "server copy of " << files[i];
-    }
+    for (size_t i = 0; i < ids.size(); ++i)
+        if (!deleted.count(ids[i]))
+            expect_identical(ids[i], files[i]);
     // The server refuses (416) a data upload that starts elsewhere than its byte count: two
     // requests of one job crossed, or a data upload went out from an old offset.
     for (const Logged &r : server_.requests()) {
@@ -322,7 +281,8 @@ TEST_F(CtrlE2ETest, StressOfThirtyJobsWithEventsAtRandomMoments)
         std::string history;
         for (const Logged &q : server_.requests_of(r.upload_id))
             history += q.line + "\n";
-        ADD_FAILURE() << "a data upload was refused for its range; the upload's requests:\n" << history;
+        ADD_FAILURE() << "a data upload was refused for its range; the upload's requests:\n"
+                      << history;
     }
 }
 

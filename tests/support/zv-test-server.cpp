@@ -22,36 +22,13 @@ size_t collect(char *data, size_t size, size_t n, void *out)
     return size * n;
 }
 
-struct Feed {
-    const std::string *data;
-    size_t off;
-};
-
-size_t feed(char *buf, size_t size, size_t n, void *p)
-{
-    auto *f = static_cast<Feed *>(p);
-    size_t len = std::min(size * n, f->data->size() - f->off);
-    memcpy(buf, f->data->data() + f->off, len);
-    f->off += len;
-    return len;
-}
-
 // The JSON string whose opening quote is at text[pos]; pos ends past its closing quote.
 std::string json_string(const std::string &text, size_t &pos)
 {
     std::string out;
     for (pos++; pos < text.size() && text[pos] != '"'; pos++) {
-        if (text[pos] != '\\') {
-            out += text[pos];
-        } else if (text[++pos] == 'u') {
-            char utf8[8] = {0};
-            g_unichar_to_utf8((gunichar)std::stoul(text.substr(pos + 1, 4), nullptr, 16), utf8);
-            out += utf8;
-            pos += 4;
-        } else {
-            const char *hit = strchr("nrt", text[pos]);
-            out += hit ? "\n\r\t"[hit - "nrt"] : text[pos];
-        }
+        const char *escape = text[pos] == '\\' ? strchr("nrt", text[++pos]) : nullptr;
+        out += escape ? "\n\r\t"[escape - "nrt"] : text[pos];
     }
     pos++;
     return out;
@@ -61,22 +38,23 @@ std::string json_string(const std::string &text, size_t &pos)
 std::vector<std::string> json_objects(const std::string &array)
 {
     std::vector<std::string> list;
-    for (size_t at = 0, end; (at = array.find('{', at)) != std::string::npos && (end = array.find('}', at)) != std::string::npos; at = end + 1)
+    for (size_t at = 0, end; (at = array.find('{', at)) != std::string::npos &&
+                             (end = array.find('}', at)) != std::string::npos;
+         at = end + 1)
         list.push_back(array.substr(at, end - at + 1));
     return list;
 }
 
 } // namespace
 
-Reply http(const std::string &method, const std::string &url, const std::vector<std::string> &headers,
-           const std::string &body)
+Reply http(const std::string &method, const std::string &url,
+           const std::vector<std::string> &headers, const std::string &body)
 {
     Reply r;
     CURL *c = curl_easy_init();
     curl_slist *list = curl_slist_append(nullptr, "Expect:");
     for (const auto &h : headers)
         list = curl_slist_append(list, h.c_str());
-    Feed up{&body, 0};
     curl_easy_setopt(c, CURLOPT_URL, url.c_str());
     curl_easy_setopt(c, CURLOPT_NOPROXY, "*");
     curl_easy_setopt(c, CURLOPT_HTTPHEADER, list);
@@ -85,16 +63,11 @@ Reply http(const std::string &method, const std::string &url, const std::vector<
     curl_easy_setopt(c, CURLOPT_WRITEDATA, &r.body);
     curl_easy_setopt(c, CURLOPT_HEADERFUNCTION, collect);
     curl_easy_setopt(c, CURLOPT_HEADERDATA, &r.headers);
-    if (method == "PUT") {
-        curl_easy_setopt(c, CURLOPT_UPLOAD, 1L);
-        curl_easy_setopt(c, CURLOPT_READFUNCTION, feed);
-        curl_easy_setopt(c, CURLOPT_READDATA, &up);
-        curl_easy_setopt(c, CURLOPT_INFILESIZE_LARGE, static_cast<curl_off_t>(body.size()));
-    } else if (!body.empty() || method == "POST") {
+    if (!body.empty() || method == "POST" || method == "PUT") {
         curl_easy_setopt(c, CURLOPT_POSTFIELDS, body.c_str());
         curl_easy_setopt(c, CURLOPT_POSTFIELDSIZE, static_cast<long>(body.size()));
     }
-    if (method != "GET" && method != "PUT")
+    if (method != "GET")
         curl_easy_setopt(c, CURLOPT_CUSTOMREQUEST, method.c_str());
     r.code = curl_easy_perform(c);
     curl_easy_getinfo(c, CURLINFO_RESPONSE_CODE, &r.status);
@@ -168,25 +141,16 @@ long long Logged::range_start() const
 
 pid_t spawn_server(const std::vector<std::string> &argv, int *port, int *tls_port)
 {
-    int out[2];
-    if (pipe(out) != 0)
-        return -1;
-    pid_t pid = fork();
-    if (pid == 0) {
-        dup2(out[1], 1);
-        close(out[0]);
-        close(out[1]);
-        exec_argv(argv);
-    }
-    close(out[1]);
+    int out = -1;
+    pid_t pid = spawn_piped(argv, nullptr, &out);
     std::string text;
     char buf[256];
-    pollfd pfd = {out[0], POLLIN, 0};
+    pollfd pfd = {out, POLLIN, 0};
     ssize_t n = 0;
-    while (std::count(text.begin(), text.end(), '\n') < (tls_port ? 2 : 1) && poll(&pfd, 1, 20000) > 0 &&
-           (n = read(out[0], buf, sizeof buf)) > 0)
+    while (std::count(text.begin(), text.end(), '\n') < (tls_port ? 2 : 1) &&
+           poll(&pfd, 1, 20000) > 0 && (n = read(out, buf, sizeof buf)) > 0)
         text.append(buf, (size_t)n);
-    close(out[0]);
+    close(out);
     // Each port is the last number on its line.
     std::istringstream lines(text);
     for (int *p : {port, tls_port}) {
@@ -201,7 +165,8 @@ bool DevServer::start(const std::string &dir, const std::vector<std::string> &ar
 {
     dir_ = dir;
     mkdir(dir.c_str(), 0700);
-    std::vector<std::string> argv = {bin_path("zuvo-devserver"), "--storage", dir + "/store", "--log", log_path()};
+    std::vector<std::string> argv = {bin_path("zuvo-devserver"), "--storage", dir + "/store",
+                                     "--log", log_path()};
     argv.insert(argv.end(), args.begin(), args.end());
     bool tls = std::count(args.begin(), args.end(), "--tls-port") > 0;
     pid_ = spawn_server(argv, &port_, tls ? &tls_port_ : nullptr);
@@ -215,11 +180,6 @@ int DevServer::stop()
         status = -1;
     pid_ = -1;
     return status >= 0 && WIFEXITED(status) ? WEXITSTATUS(status) : -1;
-}
-
-Env DevServer::env() const
-{
-    return {{"ZV_UPLOAD_HOST", host()}, {"ZV_DATA_HOST", host()}, {"ZV_ACCOUNT_HOST", host()}, {"ZV_TOKEN_HOST", host()}};
 }
 
 std::vector<Logged> DevServer::requests() const
@@ -240,16 +200,6 @@ std::vector<Logged> DevServer::requests_of(const std::string &upload_id) const
     return list;
 }
 
-bool DevServer::add_fault(const std::string &query) const
-{
-    return http("POST", url("/_admin/fault?" + query)).status == 201;
-}
-
-bool DevServer::clear_faults() const
-{
-    return http("DELETE", url("/_admin/faults")).status == 200;
-}
-
 long long DevServer::fired(const std::string &action) const
 {
     long long total = 0;
@@ -263,8 +213,9 @@ std::vector<Upload> DevServer::uploads() const
 {
     std::vector<Upload> list;
     for (const std::string &o : json_objects(http("GET", url("/_admin/uploads")).body))
-        list.push_back({json_get(o, "id"), json_get(o, "url"), json_get(o, "path"), json_number(o, "total"),
-                        json_number(o, "held"), json_get(o, "complete") == "true"});
+        list.push_back({json_get(o, "id"), json_get(o, "url"), json_get(o, "path"),
+                        json_number(o, "total"), json_number(o, "held"),
+                        json_get(o, "complete") == "true"});
     return list;
 }
 

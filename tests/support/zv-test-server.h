@@ -14,8 +14,8 @@ namespace zv_test {
 
 using Headers = std::vector<std::pair<std::string, std::string>>;
 
-// One HTTP exchange (no proxy, 60 s at most). A PUT sends body as its upload; POST, or any
-// method with a body, posts it. Response headers as received.
+// One HTTP exchange (no proxy, 60 s at most); a POST, a PUT or a request with a body sends
+// body with its Content-Length. Response headers as received.
 struct Reply {
     int code = 0; // the CURLcode
     long status = 0;
@@ -23,8 +23,8 @@ struct Reply {
     // The value of the first header line "name: value" (exact case), "" when absent.
     std::string header(const std::string &name) const;
 };
-Reply http(const std::string &method, const std::string &url, const std::vector<std::string> &headers = {},
-           const std::string &body = "");
+Reply http(const std::string &method, const std::string &url,
+           const std::vector<std::string> &headers = {}, const std::string &body = "");
 
 // A member of a flat JSON object: a string unescaped, anything else as written; "" when absent.
 std::string json_get(const std::string &object, const std::string &key);
@@ -73,15 +73,25 @@ public:
     std::string tls_host() const { return "127.0.0.1:" + std::to_string(tls_port_); }
     std::string url(const std::string &path) const { return "http://" + host() + path; }
     // ZV_UPLOAD_HOST, ZV_DATA_HOST, ZV_ACCOUNT_HOST and ZV_TOKEN_HOST naming this server.
-    Env env() const;
+    Env env() const
+    {
+        return {{"ZV_UPLOAD_HOST", host()}, {"ZV_DATA_HOST", host()}, {"ZV_ACCOUNT_HOST", host()},
+                {"ZV_TOKEN_HOST", host()}};
+    }
     std::string log_path() const { return dir_ + "/requests.log"; }
-    std::string stored(const std::string &upload_id) const { return read_file(dir_ + "/store/" + upload_id + ".data"); }
+    std::string stored(const std::string &upload_id) const
+    {
+        return read_file(dir_ + "/store/" + upload_id + ".data");
+    }
 
     std::vector<Logged> requests() const;
     std::vector<Logged> requests_of(const std::string &upload_id) const;
 
-    bool add_fault(const std::string &query) const;
-    bool clear_faults() const;
+    bool add_fault(const std::string &query) const
+    {
+        return http("POST", url("/_admin/fault?" + query)).status == 201;
+    }
+    bool clear_faults() const { return http("DELETE", url("/_admin/faults")).status == 200; }
     // How many requests the rules with this action acted on.
     long long fired(const std::string &action) const;
     std::vector<Upload> uploads() const;

@@ -31,7 +31,8 @@ std::map<pid_t, int> &reaped_by_loop()
         ECORE_EXE_EVENT_DEL,
         [](void *, int, void *event) -> Eina_Bool {
             auto *del = static_cast<Ecore_Exe_Event_Del *>(event);
-            statuses[del->pid] = del->signalled ? (del->exit_signal & 0x7f) : ((del->exit_code & 0xff) << 8);
+            statuses[del->pid] =
+                del->signalled ? (del->exit_signal & 0x7f) : ((del->exit_code & 0xff) << 8);
             return ECORE_CALLBACK_PASS_ON;
         },
         nullptr);
@@ -97,37 +98,43 @@ std::string source_path(const std::string &rel)
     return std::string(dir ? dir : ".") + "/" + rel;
 }
 
-int run_program(const std::vector<std::string> &argv, const std::string &input, std::string *out)
+pid_t spawn_piped(const std::vector<std::string> &argv, int *input, int *output)
 {
-    int in_pipe[2], out_pipe[2];
-    if (pipe(in_pipe) != 0 || pipe(out_pipe) != 0)
+    int in[2] = {-1, -1}, out[2] = {-1, -1};
+    if ((input && pipe2(in, O_CLOEXEC) != 0) || (output && pipe2(out, O_CLOEXEC) != 0))
         return -1;
     pid_t pid = fork();
-    if (pid < 0)
-        return -1;
     if (pid == 0) {
-        dup2(in_pipe[0], 0);
-        dup2(out_pipe[1], 1);
-        close(in_pipe[0]);
-        close(in_pipe[1]);
-        close(out_pipe[0]);
-        close(out_pipe[1]);
+        if (input)
+            dup2(in[0], 0);
+        if (output)
+            dup2(out[1], 1);
         exec_argv(argv);
     }
-    close(in_pipe[0]);
-    close(out_pipe[1]);
-    if (!input.empty() && write(in_pipe[1], input.data(), input.size()) < 0) {
+    close(in[0]);
+    close(out[1]);
+    if (input)
+        *input = in[1];
+    if (output)
+        *output = out[0];
+    return pid;
+}
+
+int run_program(const std::vector<std::string> &argv, const std::string &input, std::string *out)
+{
+    int to = -1, from = -1;
+    pid_t pid = spawn_piped(argv, &to, &from);
+    if (!input.empty() && write(to, input.data(), input.size()) < 0) {
         // The program may not read its input; its status tells.
     }
-    close(in_pipe[1]);
+    close(to);
     std::string collected;
     char buf[4096];
-    ssize_t n;
-    while ((n = read(out_pipe[0], buf, sizeof buf)) > 0)
+    for (ssize_t n; (n = read(from, buf, sizeof buf)) > 0;)
         collected.append(buf, (size_t)n);
-    close(out_pipe[0]);
+    close(from);
     int status = 0;
-    if (waitpid(pid, &status, 0) < 0)
+    if (pid < 0 || waitpid(pid, &status, 0) < 0)
         return -1;
     if (out)
         *out = collected;
@@ -142,7 +149,8 @@ Child::~Child()
     }
 }
 
-bool Child::start(const std::vector<std::string> &argv, const std::string &out_path, const Env &env, rlim_t nofile)
+bool Child::start(const std::vector<std::string> &argv, const std::string &out_path, const Env &env,
+                  rlim_t nofile)
 {
     reaped_by_loop();
     killed_ = false;
@@ -152,7 +160,8 @@ bool Child::start(const std::vector<std::string> &argv, const std::string &out_p
     if (pid_ == 0) {
         int in = open("/dev/null", O_RDONLY);
         dup2(in, 0);
-        int out = out_path.empty() ? -1 : open(out_path.c_str(), O_WRONLY | O_CREAT | O_APPEND, 0600);
+        int out =
+            out_path.empty() ? -1 : open(out_path.c_str(), O_WRONLY | O_CREAT | O_APPEND, 0600);
         if (out >= 0) {
             dup2(out, 1);
             dup2(out, 2);
@@ -205,7 +214,8 @@ bool Child::wait_exit(int timeout_ms, int *status)
 
 bool Child::ended_well() const
 {
-    return exited_ && (exit_status() == 0 || (killed_ && WIFSIGNALED(status_) && WTERMSIG(status_) == SIGKILL));
+    return exited_ && (exit_status() == 0 ||
+                       (killed_ && WIFSIGNALED(status_) && WTERMSIG(status_) == SIGKILL));
 }
 
 int Child::exit_status() const
@@ -264,7 +274,8 @@ int listen_loopback(int *port, int backlog)
     addr.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
     socklen_t len = sizeof addr;
     if (fd < 0 || bind(fd, reinterpret_cast<sockaddr *>(&addr), len) != 0 ||
-        listen(fd, backlog) != 0 || getsockname(fd, reinterpret_cast<sockaddr *>(&addr), &len) != 0) {
+        listen(fd, backlog) != 0 ||
+        getsockname(fd, reinterpret_cast<sockaddr *>(&addr), &len) != 0) {
         if (fd >= 0)
             close(fd);
         return -1;

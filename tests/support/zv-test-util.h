@@ -41,6 +41,10 @@ std::string source_path(const std::string &rel);
 // In a forked child: executes argv (argv[0] a path), or exits 127.
 [[noreturn]] void exec_argv(const std::vector<std::string> &argv);
 
+// Starts argv (argv[0] a path) with its standard input (*input: the write end) and output
+// (*output: the read end) on pipes, or inherited where null; the pid, or -1.
+pid_t spawn_piped(const std::vector<std::string> &argv, int *input, int *output);
+
 // Runs argv (argv[0] a path), feeding input to its standard input; returns its exit
 // status (or -1) and collects standard output into *out when given.
 int run_program(const std::vector<std::string> &argv, const std::string &input = "",
@@ -94,7 +98,10 @@ public:
     const std::string &path() const { return path_; }
     void mark() { mark_ = read_file(path_).size(); }
     std::string since_mark() const;
-    bool logged(const std::string &text) const { return since_mark().find(text) != std::string::npos; }
+    bool logged(const std::string &text) const
+    {
+        return since_mark().find(text) != std::string::npos;
+    }
 
 private:
     std::string path_;

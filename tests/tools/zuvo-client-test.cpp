@@ -26,31 +26,19 @@
 namespace
 {
 
-using Extras = std::map<std::string, std::string>;
-
 class ZuvoClientTest : public ::testing::Test
 {
   protected:
-    void SetUp() override
-    {
-        char cwd[4096];
-        ASSERT_NE(getcwd(cwd, sizeof cwd), nullptr);
-        old_cwd_ = cwd;
-        ASSERT_EQ(chdir(tmp_.path().c_str()), 0);
-    }
-    void TearDown() override
-    {
-        zv_ext_db_close();
-        EXPECT_EQ(chdir(old_cwd_.c_str()), 0);
-    }
+    void TearDown() override { zv_ext_db_close(); }
 
-    // Runs the client; its standard error goes to a file read into *err.
+    // Runs the client in the temporary folder; its standard error goes to a file read into *err.
     int client(const std::vector<std::string> &args, std::string *out = nullptr,
                std::string *err = nullptr, const std::string &input = "")
     {
         std::string err_file = tmp_.file("stderr");
-        std::vector<std::string> argv = {"/bin/sh", "-c", "exec \"$0\" \"$@\" 2>'" + err_file + "'",
-                                         zv_test::bin_path("zuvo-client")};
+        std::vector<std::string> argv = {
+            "/bin/sh", "-c", "cd '" + tmp_.path() + "' && exec \"$0\" \"$@\" 2>'" + err_file + "'",
+            zv_test::bin_path("zuvo-client")};
         argv.insert(argv.end(), args.begin(), args.end());
         int status = zv_test::run_program(argv, input, out);
         if (err)
@@ -78,16 +66,17 @@ class ZuvoClientTest : public ::testing::Test
         return rows;
     }
 
-    int history_rows()
+    // The address of the service's socket in the runtime folder.
+    sockaddr_un service_address()
     {
-        EXPECT_EQ(zv_ext_db_open(), 1);
-        int n = zv_ext_db_get_full_count();
-        zv_ext_db_close();
-        return n;
+        std::string path = tmp_.file("run") + "/zuvo-upload-svc.sock";
+        sockaddr_un addr = {};
+        addr.sun_family = AF_UNIX;
+        memcpy(addr.sun_path, path.c_str(), std::min(path.size() + 1, sizeof addr.sun_path));
+        return addr;
     }
 
     zv_test::TempDir tmp_;
-    std::string old_cwd_;
 };
 
 TEST_F(ZuvoClientTest, AddListRemoveRoundTrip)
@@ -204,33 +193,29 @@ TEST_F(ZuvoClientTest, WrongCallsExitTwoAndRecordNothing)
         EXPECT_EQ(err.rfind("zuvo-client: ", 0), 0u) << err;
         EXPECT_EQ(std::count(err.begin(), err.end(), '\n'), 1) << err;
     }
-    EXPECT_EQ(history_rows(), 0);
+    ASSERT_EQ(zv_ext_db_open(), 1);
+    EXPECT_EQ(zv_ext_db_get_full_count(), 0);
 
     std::string out;
     EXPECT_EQ(client({"add", "--help"}, &out), 0);
     EXPECT_EQ(out.rfind("Usage: zuvo-client", 0), 0u);
 }
 
-// Accepts one launch message on the service's socket, answers that it was taken and
-// returns its extras (empty when none came within the bound).
-Extras serve_one_launch(int listen_fd)
+// Accepts one launch message on the service's socket, answers that it was taken and returns
+// its extras as "KEY=VALUE|..." in key order (empty when none came within the bound).
+std::string serve_one_launch(int listen_fd)
 {
-    Extras extras;
+    std::map<std::string, std::string> extras;
     struct pollfd pfd = {listen_fd, POLLIN, 0};
-    if (poll(&pfd, 1, 30000) <= 0)
-        return extras;
-    int conn = accept(listen_fd, nullptr, nullptr);
+    int conn = poll(&pfd, 1, 30000) > 0 ? accept(listen_fd, nullptr, nullptr) : -1;
     if (conn < 0)
-        return extras;
+        return "";
     struct timeval tv = {10, 0};
     setsockopt(conn, SOL_SOCKET, SO_RCVTIMEO, &tv, sizeof tv);
     std::string msg;
     char buf[4096];
     size_t want = ZV_APP_LAUNCH_HEADER_SIZE;
-    while (msg.size() < want) {
-        ssize_t n = recv(conn, buf, sizeof buf, 0);
-        if (n <= 0)
-            break;
+    for (ssize_t n; msg.size() < want && (n = recv(conn, buf, sizeof buf, 0)) > 0;) {
         msg.append(buf, (size_t)n);
         if (msg.size() >= ZV_APP_LAUNCH_HEADER_SIZE)
             want = ZV_APP_LAUNCH_HEADER_SIZE +
@@ -245,7 +230,8 @@ Extras serve_one_launch(int listen_fd)
             [](app_control_h ac, const char *key, void *data) {
                 char *value = nullptr;
                 app_control_get_extra_data(ac, key, &value);
-                (*static_cast<Extras *>(data))[key] = value ? value : "";
+                (*static_cast<std::map<std::string, std::string> *>(data))[key] =
+                    value ? value : "";
                 free(value);
                 return true;
             },
@@ -253,67 +239,41 @@ Extras serve_one_launch(int listen_fd)
         app_control_destroy(request);
     }
     char taken = 'A';
-    if (send(conn, &taken, 1, MSG_NOSIGNAL) != 1)
-        extras.clear();
+    bool answered = send(conn, &taken, 1, MSG_NOSIGNAL) == 1;
     close(conn);
-    return extras;
+    std::string joined;
+    for (const auto &kv : extras)
+        joined += (joined.empty() ? "" : "|") + kv.first + "=" + kv.second;
+    return answered ? joined : "";
 }
 
 TEST_F(ZuvoClientTest, LaunchSendsTheBatchExtras)
 {
-    struct Case {
+    const std::string base = "ZV_DATA_ACCESS_TYPE=0|ZV_DATA_CATEGORY=c";
+    const struct {
         std::vector<std::string> args;
-        Extras expected;
-        std::string input = "", env_token = "";
-    };
-    ASSERT_TRUE(zv_test::write_file(tmp_.file("token"), "from-file\n"));
-    const Case cases[] = {
-        {{"--token", "tok", "--category", "People"},
-         {{"ZV_DATA_ACCESS_TOKEN", "tok"},
-          {"ZV_DATA_CATEGORY", "People"},
-          {"ZV_DATA_ACCESS_TYPE", "0"}}},
+        std::string expected, input = "", env_token = "";
+    } cases[] = {
+        {{"--token", "tok", "--category", "c"}, "ZV_DATA_ACCESS_TOKEN=tok|" + base},
         // The safe forms: a file, standard input, the environment.
-        {{"--token-file", "token", "--category", "c"},
-         {{"ZV_DATA_ACCESS_TOKEN", "from-file"},
-          {"ZV_DATA_CATEGORY", "c"},
-          {"ZV_DATA_ACCESS_TYPE", "0"}}},
-        {{"--token-file=-", "--category", "c"},
-         {{"ZV_DATA_ACCESS_TOKEN", "piped"},
-          {"ZV_DATA_CATEGORY", "c"},
-          {"ZV_DATA_ACCESS_TYPE", "0"}},
-         "piped\n"},
-        {{"--category", "c"},
-         {{"ZV_DATA_ACCESS_TOKEN", "from-env"},
-          {"ZV_DATA_CATEGORY", "c"},
-          {"ZV_DATA_ACCESS_TYPE", "0"}},
-         "",
-         "from-env"},
+        {{"--token-file", "token", "--category", "c"}, "ZV_DATA_ACCESS_TOKEN=from-file|" + base},
+        {{"--token-file=-", "--category", "c"}, "ZV_DATA_ACCESS_TOKEN=piped|" + base, "piped\n"},
+        {{"--category", "c"}, "ZV_DATA_ACCESS_TOKEN=from-env|" + base, "", "from-env"},
         {{"--category=Music", "--token", "t2", "--description", "two words", "--tag", "a,b",
           "--privacy", "private", "--location"},
-         {{"ZV_DATA_ACCESS_TOKEN", "t2"},
-          {"ZV_DATA_CATEGORY", "Music"},
-          {"ZV_DATA_DESCRIPTION", "two words"},
-          {"ZV_DATA_TAG", "a,b"},
-          {"ZV_DATA_ACCESS_TYPE", "2"},
-          {"ZV_DATA_USE_LOCATION", "1"}}},
+         "ZV_DATA_ACCESS_TOKEN=t2|ZV_DATA_ACCESS_TYPE=2|ZV_DATA_CATEGORY=Music|"
+         "ZV_DATA_DESCRIPTION=two words|ZV_DATA_TAG=a,b|ZV_DATA_USE_LOCATION=1"},
         {{"--token", "t", "--category", "c", "--privacy", "unlisted"},
-         {{"ZV_DATA_ACCESS_TOKEN", "t"}, {"ZV_DATA_CATEGORY", "c"}, {"ZV_DATA_ACCESS_TYPE", "1"}}},
+         "ZV_DATA_ACCESS_TOKEN=t|ZV_DATA_ACCESS_TYPE=1|ZV_DATA_CATEGORY=c"},
     };
-
-    std::string run_dir = tmp_.file("run");
-    ASSERT_EQ(mkdir(run_dir.c_str(), 0700), 0);
-    std::string sock_path = run_dir + "/zuvo-upload-svc.sock";
+    ASSERT_TRUE(zv_test::write_file(tmp_.file("token"), "from-file\n"));
+    ASSERT_EQ(mkdir(tmp_.file("run").c_str(), 0700), 0);
     int fd = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
-    ASSERT_GE(fd, 0);
-    struct sockaddr_un addr = {};
-    addr.sun_family = AF_UNIX;
-    ASSERT_LT(sock_path.size(), sizeof addr.sun_path);
-    memcpy(addr.sun_path, sock_path.c_str(), sock_path.size() + 1);
+    sockaddr_un addr = service_address();
     ASSERT_EQ(bind(fd, (struct sockaddr *)&addr, sizeof addr), 0);
     ASSERT_EQ(listen(fd, 4), 0);
-
-    for (const Case &c : cases) {
-        SCOPED_TRACE(c.args[1]);
+    for (const auto &c : cases) {
+        SCOPED_TRACE(c.expected);
         auto served = std::async(std::launch::async, serve_one_launch, fd);
         std::vector<std::string> args = {"launch"};
         args.insert(args.end(), c.args.begin(), c.args.end());
@@ -334,32 +294,25 @@ TEST_F(ZuvoClientTest, LaunchSendsTheBatchExtras)
     close(fd);
 }
 
-// The command line of every process is public (ps): with the token in a file, on standard
-// input or in the environment, neither the companion nor the service it starts shows it there.
+// The command line of every process is public (ps): with the token on standard input or in
+// the environment, neither the companion nor the service it starts shows it there.
 TEST_F(ZuvoClientTest, TokenStaysOffTheCommandLinesOfClientAndService)
 {
-    std::string sock_path = tmp_.file("run") + "/zuvo-upload-svc.sock";
     auto cmdline = [](pid_t pid) {
         return zv_test::read_file("/proc/" + std::to_string(pid) + "/cmdline");
     };
     for (bool from_stdin : {true, false}) {
         SCOPED_TRACE(from_stdin ? "--token-file -" : "ZV_ACCESS_TOKEN");
         const std::string token = from_stdin ? "secret-piped-1" : "secret-env-2";
-        int in[2];
-        ASSERT_EQ(pipe(in), 0);
-        if (!from_stdin)
+        std::vector<std::string> argv = {zv_test::bin_path("zuvo-client"), "launch", "--category",
+                                         "c"};
+        if (from_stdin)
+            argv.push_back("--token-file=-");
+        else
             setenv("ZV_ACCESS_TOKEN", token.c_str(), 1);
-        pid_t companion = fork();
-        if (companion == 0) {
-            dup2(in[0], STDIN_FILENO);
-            close(in[1]);
-            std::string prog = zv_test::bin_path("zuvo-client");
-            execl(prog.c_str(), prog.c_str(), "launch", "--category", "c",
-                  from_stdin ? "--token-file=-" : nullptr, (char *)nullptr);
-            _exit(127);
-        }
+        int in = -1;
+        pid_t companion = zv_test::spawn_piped(argv, &in, nullptr);
         unsetenv("ZV_ACCESS_TOKEN");
-        close(in[0]);
         ASSERT_GT(companion, 0);
         // With the token still to come on its standard input, the companion is running.
         if (from_stdin) {
@@ -367,17 +320,15 @@ TEST_F(ZuvoClientTest, TokenStaysOffTheCommandLinesOfClientAndService)
                 [&] { return cmdline(companion).find("launch") != std::string::npos; }));
             EXPECT_EQ(cmdline(companion).find("secret"), std::string::npos);
         }
-        ASSERT_EQ(write(in[1], (token + "\n").data(), token.size() + 1), (ssize_t)token.size() + 1);
-        close(in[1]);
+        ASSERT_EQ(write(in, (token + "\n").data(), token.size() + 1), (ssize_t)token.size() + 1);
+        close(in);
         int status = 0;
         ASSERT_EQ(waitpid(companion, &status, 0), companion);
         ASSERT_TRUE(WIFEXITED(status) && WEXITSTATUS(status) == 0);
 
         // The service it started listens on its socket; the peer's credentials name it.
         int fd = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
-        struct sockaddr_un addr = {};
-        addr.sun_family = AF_UNIX;
-        memcpy(addr.sun_path, sock_path.c_str(), sock_path.size() + 1);
+        sockaddr_un addr = service_address();
         ASSERT_TRUE(zv_test::wait_for(
             [&] { return connect(fd, (struct sockaddr *)&addr, sizeof addr) == 0; }, 30000));
         struct ucred cred = {};

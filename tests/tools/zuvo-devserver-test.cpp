@@ -25,21 +25,28 @@ std::string pattern(size_t n)
 // A running zuvo-devserver that ends with status 0 at SIGTERM.
 class DevServerTest : public ::testing::Test {
 protected:
-    void start(const std::vector<std::string> &args = {}) { ASSERT_TRUE(server_.start(dir_.path(), args)); }
+    void start(const std::vector<std::string> &args = {})
+    {
+        ASSERT_TRUE(server_.start(dir_.path(), args));
+    }
     void TearDown() override { EXPECT_EQ(server_.stop(), 0); }
 
     Reply meta(const std::string &token = "T1", const std::string &key = "K1")
     {
         return http("POST", server_.url("/resumable/feeds/api/users/default/uploads"),
                     {"Content-Type: application/atom+xml; charset=UTF-8", "ZvData-Version: 2",
-                     "Authorization: Bearer " + token, "X-ZvData-Key: key=" + key, "Slug: clip.mp4"},
+                     "Authorization: Bearer " + token, "X-ZvData-Key: key=" + key,
+                     "Slug: clip.mp4"},
                     "<?xml version=\"1.0\"?>\r\n<entry/>");
     }
     Reply put(const std::string &url, const std::string &range, const std::string &body)
     {
         return http("PUT", url, {"Content-Range: " + range}, body);
     }
-    Reply admin_fault(const std::string &query) { return http("POST", server_.url("/_admin/fault?" + query)); }
+    Reply admin_fault(const std::string &query)
+    {
+        return http("POST", server_.url("/_admin/fault?" + query));
+    }
 
     zv_test::TempDir dir_{false};
     zv_test::DevServer server_;
@@ -88,7 +95,8 @@ TEST_F(DevServerTest, DiscardDataCountsBytesWithoutStoringThem)
     std::string id = url.substr(url.rfind('/') + 1);
     EXPECT_EQ(server_.stored(id), "");
     std::string listing = http("GET", server_.url("/_admin/uploads/" + id)).body;
-    EXPECT_NE(listing.find("\"total\":5000,\"held\":5000,\"complete\":true"), std::string::npos) << listing;
+    EXPECT_NE(listing.find("\"total\":5000,\"held\":5000,\"complete\":true"), std::string::npos)
+        << listing;
 }
 
 TEST_F(DevServerTest, FaultsByAdminRequest)
@@ -118,8 +126,10 @@ TEST_F(DevServerTest, FaultsByAdminRequest)
     EXPECT_EQ(bad.status, 400);
     EXPECT_NE(bad.body.find("bytes"), std::string::npos);
     std::string rules = http("GET", server_.url("/_admin/faults")).body;
-    EXPECT_NE(rules.find("\"action\":\"status\",\"nth\":2,\"times\":1,\"status\":500,\"seen\":4,\"fired\":1"),
-              std::string::npos)
+    EXPECT_NE(
+        rules.find(
+            "\"action\":\"status\",\"nth\":2,\"times\":1,\"status\":500,\"seen\":4,\"fired\":1"),
+        std::string::npos)
         << rules;
     EXPECT_TRUE(server_.clear_faults());
     EXPECT_EQ(http("GET", server_.url("/_admin/faults")).body, "[]\n");
