@@ -12,12 +12,11 @@
 #include <sys/resource.h>
 #include <unistd.h>
 
-#include <algorithm>
 #include <string>
 #include <vector>
 
-#include "zv-test-util.h"
 #include "app.h"
+#include "zv-test-util.h"
 
 namespace
 {
@@ -168,9 +167,8 @@ TEST_F(DesktopNotificationTest, ShownReplacedClickedAndClosed)
                               NOTIFICATION_VARIABLE_TYPE_NONE);
         ASSERT_EQ(notification_update(ongoing), NOTIFICATION_ERROR_NONE);
     }
-    ASSERT_TRUE(wait_for([] {
-        return !g_calls.empty() && g_calls.back() == "41|Uploading|c.mp4|default,Open|37";
-    }));
+    ASSERT_TRUE(wait_for(
+        [] { return !g_calls.empty() && g_calls.back() == "41|Uploading|c.mp4|default,Open|37"; }));
     EXPECT_EQ(g_calls[0], "0|Uploading|a.mp4|default,Open|37");
     EXPECT_EQ(g_calls[1], "0|Uploading|done||-1");
     for (size_t i = 2; i < g_calls.size(); i++)
