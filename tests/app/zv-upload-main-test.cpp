@@ -1,6 +1,6 @@
 // The service's process entry: the launch extras read into the batch settings, the window
-// stack built at create and taken down at terminate, one pair of key handlers per launch,
-// and the real program as a running instance that takes later launches and ends on SIGTERM.
+// stack built at create and taken down at terminate, one pair of key handlers per launch.
+// The real program as a running instance is the end-to-end tests' (tests/e2e).
 #include <Ecore.h>
 #include <Ecore_Input.h>
 #include <Elementary.h>
@@ -25,19 +25,8 @@ using namespace zv_test;
 namespace
 {
 
-// Every log line of this process and of the programs it starts goes to one file.
+// Every log line of this process goes to one file.
 LogFile process_log;
-
-// Whether process pid logged text since the log's mark.
-bool logged_by(pid_t pid, const std::string &text)
-{
-    std::istringstream lines(process_log.since_mark());
-    const std::string tag = "(" + std::to_string(pid) + "): ";
-    for (std::string line; std::getline(lines, line);)
-        if (line.find(tag) != std::string::npos && line.find(text) != std::string::npos)
-            return true;
-    return false;
-}
 
 app_control_h make_request(const std::vector<std::pair<const char *, const char *>> &extras)
 {
@@ -101,7 +90,7 @@ TEST(UploadMainExtras, ReadingRules)
         process_log.mark();
         EXPECT_EQ(_zv_upload_main_get_app_control_info(h, &ad), !c.failure) << c.batch;
         app_control_destroy(h);
-        EXPECT_TRUE(!c.failure || logged_by(getpid(), c.failure)) << process_log.since_mark();
+        EXPECT_TRUE(!c.failure || process_log.logged(c.failure)) << process_log.since_mark();
         EXPECT_EQ(batch(ad), c.batch);
     }
     free(ad.access_token);
@@ -195,31 +184,4 @@ TEST(UploadMainApp, MissingTablesAndNullArguments)
     EXPECT_TRUE(ad.is_paused);
     _app_resume(&ad);
     EXPECT_FALSE(ad.is_paused);
-}
-
-TEST(UploadMainProgram, RunsAsInstanceTakesLaterLaunchesAndEndsOnSigterm)
-{
-    TempDir tmp;
-    const std::string svc = bin_path("zuvo-upload-svc");
-    process_log.mark();
-    Child instance;
-    ASSERT_TRUE(instance.start({svc, "--extra", "ZV_DATA_ACCESS_TOKEN=t", "--extra",
-                                "ZV_DATA_CATEGORY=Music", "--extra", "ZV_DATA_ACCESS_TYPE=0"}));
-    const pid_t pid = instance.pid();
-    ASSERT_TRUE(wait_for([&] { return logged_by(pid, "_app_resume"); }, 30000))
-        << process_log.since_mark();
-
-    // A later launch without the access type is handed over; the instance keeps running.
-    EXPECT_EQ(run_program(
-                  {svc, "--extra", "ZV_DATA_ACCESS_TOKEN=t2", "--extra", "ZV_DATA_CATEGORY=Pets"}),
-              0);
-    EXPECT_TRUE(wait_for([&] { return logged_by(pid, "get bundle value fail"); }, 10000));
-    EXPECT_TRUE(logged_by(pid, "app_control_get_extra_data error : -126"));
-    EXPECT_EQ(run_program({svc, "--extra", "broken"}), 2);
-
-    instance.signal(SIGTERM);
-    ASSERT_TRUE(instance.wait_exit(20000));
-    EXPECT_EQ(instance.exit_status(), 0);
-    EXPECT_TRUE(logged_by(pid, "_app_terminate"));
-    EXPECT_TRUE(logged_by(pid, "ui_app_main() loop"));
 }

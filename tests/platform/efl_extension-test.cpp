@@ -1,6 +1,7 @@
 // EFL extension: back and more key presses, fed as key-down events of the main loop, reach
-// the newest visible registration of that key; hidden and deleted objects and deleted
-// callbacks drop out.
+// the newest visible registration of that key. The view's tests press Escape, Menu and F2 on
+// the list and its popups; here, what they do not reach: the other key names, a hidden
+// registration, and a deleted callback.
 #include "efl_extension.h"
 
 #include <Ecore_Input.h>
@@ -40,38 +41,21 @@ void press(const char *keyname)
 
 TEST(Eext, KeysReachTheNewestVisibleRegistration)
 {
-    EXPECT_STREQ(eext_key_name_map("Escape"), EEXT_KEY_BACK);
-    EXPECT_STREQ(eext_key_name_map("Menu"), EEXT_KEY_MORE);
-    EXPECT_STREQ(eext_key_name_map("F2"), EEXT_KEY_MORE);
-    EXPECT_STREQ(eext_key_name_map("XF86Back"), EEXT_KEY_BACK);
-    EXPECT_STREQ(eext_key_name_map("Return"), "Return");
-
     Evas_Object *win = elm_win_add(nullptr, "eext-test", ELM_WIN_BASIC);
     Evas_Object *navi = elm_naviframe_add(win);
     evas_object_show(navi);
     evas_object_show(win);
     eext_object_event_callback_add(navi, EEXT_CALLBACK_BACK, record_cb, (void *)"back:navi");
     eext_object_event_callback_add(navi, EEXT_CALLBACK_MORE, record_cb, (void *)"more:navi");
-    for (const char *key : {"Escape", "Menu", "F2", "Return"}) // Return: no hardware key
-        press(key);
-    EXPECT_EQ(g_calls, (std::vector<std::string>{"back:navi", "more:navi", "more:navi"}));
-
-    // A popup registered later takes both keys while it is shown; hidden, it lets the
-    // naviframe have them; deleted, it is forgotten.
+    press("Return"); // no hardware key; the window settles meanwhile
     Evas_Object *popup = elm_ctxpopup_add(win);
     eext_object_event_callback_add(popup, EEXT_CALLBACK_BACK, record_cb, (void *)"back:popup");
-    eext_object_event_callback_add(popup, EEXT_CALLBACK_MORE, record_cb, (void *)"more:popup");
     evas_object_show(popup);
-    g_calls.clear();
     press("Escape");
-    press("XF86Menu");
+    press("XF86Menu"); // the popup has no more key: the naviframe takes it
     evas_object_hide(popup);
-    press("Escape");
-    evas_object_show(popup);
-    evas_object_del(popup);
-    press("Escape");
-    EXPECT_EQ(g_calls,
-              (std::vector<std::string>{"back:popup", "more:popup", "back:navi", "back:navi"}));
+    press("XF86Back");
+    EXPECT_EQ(g_calls, (std::vector<std::string>{"back:popup", "more:navi", "back:navi"}));
 
     // A deleted callback gives its data back once and is called no more.
     EXPECT_STREQ(static_cast<const char *>(

@@ -12,12 +12,11 @@
 #include <sys/resource.h>
 #include <unistd.h>
 
-#include <algorithm>
 #include <string>
 #include <vector>
 
-#include "../app/zv-app-test-util.h"
 #include "app.h"
+#include "zv-test-util.h"
 
 namespace
 {
@@ -134,38 +133,23 @@ class DesktopNotificationTest : public ::testing::Test
 };
 
 // Updates made before the service has answered are sent once it has, as replacements of the
-// id it gave; a delete closes that id.
-TEST_F(DesktopNotificationTest, PostedNotificationIsShownReplacedAndClosed)
-{
-    notification_h noti = make(NOTIFICATION_TYPE_ONGOING, "desktop_test", "a.mp4");
-    ASSERT_EQ(notification_post(noti), NOTIFICATION_ERROR_NONE);
-    for (const char *content : {"b.mp4", "c.mp4"}) {
-        notification_set_text(noti, NOTIFICATION_TEXT_TYPE_CONTENT, content, nullptr,
-                              NOTIFICATION_VARIABLE_TYPE_NONE);
-        ASSERT_EQ(notification_update(noti), NOTIFICATION_ERROR_NONE);
-    }
-    ASSERT_TRUE(
-        wait_for([] { return !g_calls.empty() && g_calls.back() == "41|Uploading|c.mp4||-1"; }));
-    EXPECT_EQ(g_calls.front().substr(0, 12), "0|Uploading|");
-    for (size_t i = 1; i < g_calls.size(); i++)
-        EXPECT_EQ(g_calls[i].substr(0, 3), "41|") << g_calls[i];
-    EXPECT_EQ(zv_test::read_file(id_file("desktop_test")), "41\n");
-
-    ASSERT_EQ(notification_delete(noti), NOTIFICATION_ERROR_NONE);
-    ASSERT_TRUE(wait_for([] { return g_calls.back() == "close 41"; }));
-    EXPECT_NE(access(id_file("desktop_test").c_str(), F_OK), 0);
-    notification_free(noti);
-}
-
-// The ongoing notification carries the default action and its progress as the "value" hint;
-// a click on it sends its application, here running, a launch request. A notification that
-// launches nothing (the completion one) has no action.
-TEST_F(DesktopNotificationTest, ClickLaunchesTheApplication)
+// id it gave; a delete closes that id. The ongoing notification carries the default action
+// and its progress as the "value" hint; a click on it sends its application, here running, a
+// launch request. A notification that launches nothing (the completion one) has no action.
+TEST_F(DesktopNotificationTest, ShownReplacedClickedAndClosed)
 {
     std::string probe_log = dir_->file("probe.log");
-    setenv("ZV_PROBE_LOG", probe_log.c_str(), 1);
-    pid_t app = zv_test::spawn_program({zv_test::bin_path("zv-app-probe")});
-    ASSERT_TRUE(wait_for([&] { return zv_test::has_line(probe_log, "app_control"); }, 20000));
+    auto launches = [&] {
+        std::string log = zv_test::read_file(probe_log);
+        size_t n = 0;
+        for (size_t at = log.find("app_control\n"); at != std::string::npos;
+             at = log.find("app_control\n", at + 1))
+            n++;
+        return n;
+    };
+    zv_test::Child app;
+    ASSERT_TRUE(app.start({zv_test::bin_path("zv-app-probe")}, "", {{"ZV_PROBE_LOG", probe_log}}));
+    ASSERT_TRUE(wait_for([&] { return launches() == 1; }, 20000));
 
     notification_h ongoing = make(NOTIFICATION_TYPE_ONGOING, "click_ongoing", "a.mp4");
     app_control_h launch = nullptr;
@@ -178,13 +162,19 @@ TEST_F(DesktopNotificationTest, ClickLaunchesTheApplication)
     notification_set_property(done, NOTIFICATION_PROP_DISABLE_APP_LAUNCH);
     ASSERT_EQ(notification_post(ongoing), NOTIFICATION_ERROR_NONE);
     ASSERT_EQ(notification_post(done), NOTIFICATION_ERROR_NONE);
-    ASSERT_TRUE(wait_for([] { return g_calls.size() == 2; }));
+    for (const char *content : {"b.mp4", "c.mp4"}) {
+        notification_set_text(ongoing, NOTIFICATION_TEXT_TYPE_CONTENT, content, nullptr,
+                              NOTIFICATION_VARIABLE_TYPE_NONE);
+        ASSERT_EQ(notification_update(ongoing), NOTIFICATION_ERROR_NONE);
+    }
+    ASSERT_TRUE(wait_for(
+        [] { return !g_calls.empty() && g_calls.back() == "41|Uploading|c.mp4|default,Open|37"; }));
     EXPECT_EQ(g_calls[0], "0|Uploading|a.mp4|default,Open|37");
     EXPECT_EQ(g_calls[1], "0|Uploading|done||-1");
-    auto launches = [&] {
-        auto lines = zv_test::read_lines(probe_log);
-        return std::count(lines.begin(), lines.end(), "app_control");
-    };
+    for (size_t i = 2; i < g_calls.size(); i++)
+        EXPECT_EQ(g_calls[i].substr(0, 3), "41|") << g_calls[i];
+    EXPECT_EQ(zv_test::read_file(id_file("click_ongoing")), "41\n");
+
     for (const char *tag : {"click_complete", "click_ongoing"}) {
         ASSERT_TRUE(wait_for([&] { return access(id_file(tag).c_str(), F_OK) == 0; }));
         uint32_t id = g_ascii_strtoull(zv_test::read_file(id_file(tag)).c_str(), nullptr, 10);
@@ -193,13 +183,15 @@ TEST_F(DesktopNotificationTest, ClickLaunchesTheApplication)
     EXPECT_TRUE(wait_for([&] { return launches() == 2; }, 10000));
     EXPECT_FALSE(wait_for([&] { return launches() > 2; }, 500));
 
-    for (notification_h n : {ongoing, done}) {
-        notification_delete(n);
+    ASSERT_EQ(notification_delete(ongoing), NOTIFICATION_ERROR_NONE);
+    ASSERT_TRUE(wait_for([] { return g_calls.back() == "close 41"; }));
+    EXPECT_NE(access(id_file("click_ongoing").c_str(), F_OK), 0);
+    notification_delete(done);
+    for (notification_h n : {ongoing, done})
         notification_free(n);
-    }
-    kill(app, SIGTERM);
-    EXPECT_EQ(zv_test::wait_program(app), 0);
-    unsetenv("ZV_PROBE_LOG");
+    app.signal(SIGTERM);
+    EXPECT_TRUE(app.wait_exit(20000));
+    EXPECT_EQ(app.exit_status(), 0);
 }
 
 // A tray file that cannot be written while no descriptor is left is written once they are
