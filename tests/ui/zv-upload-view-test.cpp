@@ -201,13 +201,12 @@ class ViewTest : public ::testing::Test
         zv_ext_db_close();
     }
 
-    UploadItem *add_job(int id, int status, int percent, const char *display_name = "clip.mp4",
+    UploadItem *add_job(int id, int status, const char *display_name = "clip.mp4",
                         const char *thumb = nullptr)
     {
         auto *job = g_new0(UploadItem, 1);
         job->historyid = id;
         job->status = status;
-        job->percent = percent;
         job->title = g_strdup_printf("Title %d", id);
         job->display_name = g_strdup(display_name);
         job->thumb_path = g_strdup(thumb);
@@ -234,6 +233,18 @@ class ViewTest : public ::testing::Test
     Evas_Object *select_all_bar()
     {
         return elm_object_part_content_get(ad->pEditLayout, "elm.swallow.content.select.all");
+    }
+    // The edit page as a user reads it: the title, Done on or off, the rows' check boxes and
+    // the select-all check box.
+    std::string edit_state()
+    {
+        std::string text = title() + (elm_object_disabled_get(button(true)) ? ", off, " : ", on, ");
+        for (GList *l = ad->job_list; l; l = l->next)
+            text += elm_check_state_get(static_cast<UploadItem *>(l->data)->check) ? '1' : '0';
+        return text +
+               (elm_check_state_get(elm_object_part_content_get(select_all_bar(), "elm.icon"))
+                    ? ", all"
+                    : "");
     }
 
     // More key; returns once the menu is laid out (a dismissal before that is lost).
@@ -300,8 +311,8 @@ TEST_F(ViewTest, BadgesMenuAndKeys)
 {
     // A picture wider than tall, as video frames are.
     const std::string thumb = zv_test::source_path("res/edje/images/zv_nocontents_uploads.png");
-    UploadItem *job = add_job(1, ZV_UPLOAD_STATUS_UPLOADING, 37, "a.mp4", thumb.c_str());
-    UploadItem *waiting = add_job(2, ZV_UPLOAD_STATUS_WAITING, 0);
+    UploadItem *job = add_job(1, ZV_UPLOAD_STATUS_UPLOADING, "a.mp4", thumb.c_str());
+    UploadItem *waiting = add_job(2, ZV_UPLOAD_STATUS_WAITING);
     show_list();
     for (UploadItem *j : {job, waiting})
         EXPECT_EQ(
@@ -367,10 +378,10 @@ TEST_F(ViewTest, EditModeSelectsAndDeletes)
     std::string ongoing = tmp.file("run/notifications/zuvo_ongoing_noti.ini");
     ASSERT_EQ(zv_ext_db_open(), 1);
     ASSERT_EQ(zuvo_ext_noti_ongoing_noti_create("ZuVo", "Uploading", 0, 2, 0.1), 1);
-    UploadItem *a = add_job(1, ZV_UPLOAD_STATUS_COMPLETED, 100);
-    UploadItem *b = add_job(2, ZV_UPLOAD_STATUS_PAUSED, 30);
-    UploadItem *c = add_job(3, ZV_UPLOAD_STATUS_UPLOADING, 20);
-    UploadItem *d = add_job(4, ZV_UPLOAD_STATUS_WAITING, 0);
+    UploadItem *a = add_job(1, ZV_UPLOAD_STATUS_COMPLETED);
+    UploadItem *b = add_job(2, ZV_UPLOAD_STATUS_PAUSED);
+    UploadItem *c = add_job(3, ZV_UPLOAD_STATUS_UPLOADING);
+    UploadItem *d = add_job(4, ZV_UPLOAD_STATUS_WAITING);
     ad->completed_count = 1;
     ad->total_count = 3;
     show_list();
@@ -401,32 +412,26 @@ TEST_F(ViewTest, EditModeSelectsAndDeletes)
     touch_target(evas_object_smart_parent_get(find_text("Remove")));
     enter_edit_mode(true);
     EXPECT_EQ(ad->pCtxPopup, nullptr);
-    EXPECT_EQ(title(), "Select uploads");
+    EXPECT_EQ(edit_state(), "Select uploads, off, 0000");
     EXPECT_EQ(str(elm_object_text_get(button(true))), "Done");
     EXPECT_EQ(str(elm_object_text_get(button(false))), "Cancel");
     EXPECT_EQ(str(elm_object_part_text_get(select_all_bar(), "elm.text.main")), "Select all");
-    Evas_Object *all = elm_object_part_content_get(select_all_bar(), "elm.icon");
-    for (Evas_Object *obj : {button(false), button(true), a->check, all})
+    for (Evas_Object *obj : {button(false), button(true), a->check,
+                             elm_object_part_content_get(select_all_bar(), "elm.icon")})
         touch_target(obj);
-    EXPECT_TRUE(elm_object_disabled_get(button(true)));
     tap(a);
     tap(c);
-    EXPECT_EQ(title(), "2 selected");
-    EXPECT_FALSE(elm_object_disabled_get(button(true)));
-    EXPECT_FALSE(elm_check_state_get(b->check) || elm_check_state_get(all));
+    EXPECT_EQ(edit_state(), "2 selected, on, 1010");
     tap(b);
     tap(d);
-    EXPECT_TRUE(elm_check_state_get(all));
+    EXPECT_EQ(edit_state(), "4 selected, on, 1111, all");
     for (UploadItem *job : {a, b, c, d})
         tap(job);
-    EXPECT_TRUE(elm_object_disabled_get(button(true)));
-    EXPECT_EQ(title(), "Select uploads");
+    EXPECT_EQ(edit_state(), "Select uploads, off, 0000");
     press_select_all();
-    EXPECT_TRUE(a->checked && b->checked && c->checked && d->checked);
-    EXPECT_EQ(title(), "4 selected");
+    EXPECT_EQ(edit_state(), "4 selected, on, 1111, all");
     press_select_all();
-    EXPECT_FALSE(a->checked || b->checked || c->checked || d->checked);
-    EXPECT_TRUE(elm_object_disabled_get(button(true)));
+    EXPECT_EQ(edit_state(), "Select uploads, off, 0000");
 
     Evas_Object *genlist = ad->pGenlist;
     c->status = ZV_UPLOAD_STATUS_COMPLETED;
@@ -455,8 +460,7 @@ TEST_F(ViewTest, EditModeSelectsAndDeletes)
     touch_target(elm_object_part_content_get(popup, "button1"));
     feed_key("Escape");
     EXPECT_EQ(find_popup(), nullptr);
-    EXPECT_TRUE(b->checked && c->checked);
-    EXPECT_EQ(title(), "2 selected");
+    EXPECT_EQ(edit_state(), "2 selected, on, 110");
     EXPECT_GE(font_size("2 selected"), row_size);
     click(button(true));
     ASSERT_NE(popup = find_popup(), nullptr);
@@ -494,8 +498,8 @@ TEST_F(ViewTest, MissingThemeFilesKeepTheDefaultLook)
 {
     std::string saved = str(getenv("ZV_RES_DIR"));
     setenv("ZV_RES_DIR", (tmp.path() + "/").c_str(), 1);
-    UploadItem *job = add_job(1, ZV_UPLOAD_STATUS_PAUSED, 50);
-    add_job(2, ZV_UPLOAD_STATUS_COMPLETED, 100);
+    UploadItem *job = add_job(1, ZV_UPLOAD_STATUS_PAUSED);
+    add_job(2, ZV_UPLOAD_STATUS_COMPLETED);
     g_log.mark();
     show_list();
     click(job->badge);
