@@ -4,8 +4,6 @@
 #include <gtest/gtest.h>
 #include <unistd.h>
 
-#include <string>
-
 #include "zv-test-util.h"
 #include "zv-upload-main.h"
 
@@ -22,38 +20,33 @@ TEST(ExtUtil, FirstContextStaysFileSizesAndTheIdIsTheTime)
     EXPECT_EQ(zv_ext_util_get_appdata(), &first);
 
     zv_test::TempDir tmp;
-    ASSERT_TRUE(zv_test::write_file(tmp.file("five"), "12345"));
-    ASSERT_TRUE(zv_test::write_file(tmp.file("video"), ""));
-    EXPECT_EQ(zv_ext_util_get_file_size(tmp.file("video").c_str()), 0);
-    ASSERT_EQ(truncate(tmp.file("video").c_str(), 5000000000LL), 0); // sparse, past 4 GiB
-    EXPECT_EQ(zv_ext_util_get_file_size(tmp.file("five").c_str()), 5);
-    EXPECT_EQ(zv_ext_util_get_file_size(tmp.file("video").c_str()), 5000000000LL);
+    const std::string five = tmp.file("five"), video = tmp.file("video");
+    ASSERT_TRUE(zv_test::write_file(five, "12345") && zv_test::write_file(video, ""));
+    EXPECT_EQ(zv_ext_util_get_file_size(video.c_str()), 0);
+    ASSERT_EQ(truncate(video.c_str(), 5000000000LL), 0); // sparse, past 4 GiB
+    EXPECT_EQ(zv_ext_util_get_file_size(five.c_str()), 5);
+    EXPECT_EQ(zv_ext_util_get_file_size(video.c_str()), 5000000000LL);
     EXPECT_EQ(zv_ext_util_get_file_size(tmp.file("missing").c_str()), -1);
     EXPECT_EQ(zv_ext_util_get_file_size(nullptr), -1);
 
-    time_t before = time(nullptr);
-    time_t id = zv_ext_util_generate_id();
-    EXPECT_GE(id, before);
-    EXPECT_LE(id, time(nullptr));
+    time_t before = time(nullptr), id = zv_ext_util_generate_id();
+    EXPECT_TRUE(id >= before && id <= time(nullptr));
 }
 
-struct ExtUtilPopup : ::testing::Test {
-    ExtUtilPopup()
-    {
-        evas_object_resize(win, 360, 640);
-        evas_object_show(win);
-    }
-    ~ExtUtilPopup() override { evas_object_del(win); }
-    static void count_cb(void *data, Evas_Object *, void *) { ++*static_cast<int *>(data); }
-
-    Evas_Object *win = elm_win_add(nullptr, "zv-ext-util-test", ELM_WIN_BASIC);
-    int calls = 0;
-};
+void count_cb(void *data, Evas_Object *, void *)
+{
+    ++*static_cast<int *>(data);
+}
 
 // The message popup and the processing popup with a timeout call back once it passes; the
-// processing popup without one stays, its one row a "1line" item.
-TEST_F(ExtUtilPopup, PopupsTimeOutWhenTheyHaveATimeout)
+// processing popup without one stays, its one row a "1line" item. The account popup numbers
+// its rows past null entries and hands the chosen account to its callback.
+TEST(ExtUtilPopup, PopupsTimeOutAndAccountsAreChosen)
 {
+    Evas_Object *win = elm_win_add(nullptr, "zv-ext-util-test", ELM_WIN_BASIC);
+    evas_object_resize(win, 360, 640);
+    evas_object_show(win);
+    int calls = 0;
     for (auto create : {zv_ext_util_create_popup, zv_ext_util_create_list_popup}) {
         EXPECT_EQ(create(nullptr, "t", 1.0, count_cb, &calls), nullptr);
         EXPECT_EQ(create(win, "t", 1.0, count_cb, nullptr), nullptr);
@@ -69,12 +62,10 @@ TEST_F(ExtUtilPopup, PopupsTimeOutWhenTheyHaveATimeout)
     EXPECT_STREQ(elm_object_text_get(message), "Saved");
     EXPECT_TRUE(zv_test::wait_for([&] { return calls == 1; }));
     Evas_Object *kept = zv_ext_util_create_list_popup(win, "Working", 0.0, count_cb, &calls);
-    ASSERT_NE(kept, nullptr);
-    EXPECT_EQ(elm_popup_timeout_get(kept), 0.0);
     Evas_Object *timed = zv_ext_util_create_list_popup(win, "Working", 0.05, count_cb, &calls);
-    ASSERT_NE(timed, nullptr);
+    ASSERT_TRUE(kept && timed);
+    EXPECT_EQ(elm_popup_timeout_get(kept), 0.0);
     EXPECT_TRUE(zv_test::wait_for([&] { return calls == 2; }));
-
     Eina_List *children = elm_box_children_get(elm_object_content_get(kept));
     ASSERT_EQ(eina_list_count(children), 1u);
     auto *genlist = static_cast<Evas_Object *>(eina_list_data_get(children));
@@ -82,12 +73,7 @@ TEST_F(ExtUtilPopup, PopupsTimeOutWhenTheyHaveATimeout)
     Elm_Object_Item *row = elm_genlist_first_item_get(genlist);
     EXPECT_STREQ(elm_genlist_item_item_class_get(row)->item_style, "1line");
     EXPECT_EQ(calls, 2);
-    for (Evas_Object *popup : {message, kept, timed})
-        zv_ext_util_destroy_popup(popup);
-}
 
-TEST_F(ExtUtilPopup, AccountPopupNumbersRowsPastNullEntries)
-{
     char name_a[] = "alice@example.com", name_b[] = "bob@example.com";
     account_info a = {}, b = {};
     a.display_name = name_a;
@@ -102,15 +88,15 @@ TEST_F(ExtUtilPopup, AccountPopupNumbersRowsPastNullEntries)
         zv_ext_util_create_account_select_popup(win, "Accounts", accounts, select_cb, &chosen);
     ASSERT_NE(popup, nullptr);
     EXPECT_STREQ(elm_object_part_text_get(popup, "title,text"), "Accounts");
-    EXPECT_EQ(a.position, 0);
-    EXPECT_EQ(b.position, 2);
-    EXPECT_EQ(b.user_data, &chosen);
-    Evas_Object *genlist = elm_object_content_get(popup);
+    EXPECT_TRUE(a.position == 0 && b.position == 2 && b.user_data == &chosen);
+    genlist = elm_object_content_get(popup);
     ASSERT_EQ(elm_genlist_items_count(genlist), 2u);
     elm_genlist_item_selected_set(elm_genlist_last_item_get(genlist), EINA_TRUE);
     EXPECT_EQ(chosen, &b);
-    zv_ext_util_destroy_popup(popup);
+    for (Evas_Object *p : {message, kept, timed, popup})
+        zv_ext_util_destroy_popup(p);
     g_list_free(accounts);
+    evas_object_del(win);
 }
 
 } // namespace
