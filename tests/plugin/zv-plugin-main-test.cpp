@@ -507,6 +507,35 @@ TEST_F(ClientTest, CategoryLabelsInDocumentOrderWithLanguageFallback)
         targets.push_back(r.get("method") + " " + r.get("target"));
     const std::string doc = "GET /schemas/2007/categories.cat";
     EXPECT_EQ(targets, (std::vector<std::string>{doc, doc + "?hl=xx", doc, doc + "?hl=ko"}));
+
+    // Documents the server is told to answer with: only labels of category elements count.
+    const std::string labelled =
+        "<?xml version=\"1.0\"?>\n<app:categories xmlns:app=\"http://www.w3.org/2007/app\" "
+        "xmlns:atom=\"http://www.w3.org/2005/Atom\">\n"
+        "  <atom:category term=\"Film\" label=\"Film\"/>\n"
+        "  <!-- a comment -->\n"
+        "  <atom:category term=\"Untitled\"/>\n"
+        "  <atom:term label=\"Not a category\"/>\n"
+        "  <category scheme=\"x\" label=\"Music &amp; Dance\" term=\"Music\"/>\n"
+        "  <atom:category label=\"Sports\"/>\n"
+        "</app:categories>\n";
+    const struct {
+        const char *status, *doc;
+        std::vector<std::string> expected;
+    } cases[] = {
+        {"200", labelled.c_str(), {"Film", "Music & Dance", "Sports"}},
+        {"200", "<feed><category label=\"Film\"/></feed>", {}}, // another root
+        {"200", "Film, Music", {}},                              // not XML
+        {"404", "", {}},
+    };
+    for (const auto &c : cases) {
+        ASSERT_TRUE(server_->clear_faults());
+        gchar *body = g_uri_escape_string(c.doc, nullptr, false);
+        ASSERT_TRUE(server_->add_fault(std::string("kind=category&action=status&times=0&status=") +
+                                       c.status + "&body=" + body));
+        g_free(body);
+        EXPECT_EQ(labels("de"), c.expected) << c.doc;
+    }
 }
 
 // --- Login and token refresh (https) ---
