@@ -335,8 +335,7 @@ TEST_F(ClientTest, MetaUploadSendsHeadersAndEntryInOrder)
 
 TEST_F(ClientTest, MetaUploadAnswersThatFail)
 {
-    start_server({"--fault", "kind=meta,action=nolocation,nth=3", "--fault",
-                  "kind=meta,action=status,status=400,nth=4"});
+    start_server({"--fault", "kind=meta,action=status,status=400,nth=3"});
     const std::string long_token(600, 't');
     const struct {
         const char *name;
@@ -345,7 +344,6 @@ TEST_F(ClientTest, MetaUploadAnswersThatFail)
     } cases[] = {
         {"refused token", "wrong", server_->host(), -999, 401},
         {"header line cut at 511", long_token, server_->host(), -999, 401},
-        {"no Location", TOKEN, server_->host(), 0, 201},
         {"status 400", TOKEN, server_->host(), -999, 400},
         {"nobody listening", TOKEN, "127.0.0.1:1", -999, 0},
     };
@@ -359,7 +357,7 @@ TEST_F(ClientTest, MetaUploadAnswersThatFail)
         EXPECT_EQ(a.value, std::nullopt) << c.name;
     }
     const auto requests = server_->requests();
-    ASSERT_EQ(requests.size(), 4u);
+    ASSERT_EQ(requests.size(), 3u);
     EXPECT_EQ(requests[1].header("Authorization"), "Bearer " + long_token.substr(0, 511 - 22));
 }
 
@@ -604,6 +602,13 @@ TEST_F(AccountTest, LoginAndTokenRefreshPostTheirForms)
     EXPECT_EQ(r[2].body(), prefix + "refresh-1&grant_type=refresh_token");
     EXPECT_EQ(r[2].header("User-Agent"), std::nullopt);
     EXPECT_EQ(r[3].body(), prefix + std::string(1023 - prefix.size(), 'r'));
+    // The engine's verbose log shows the forms with their credentials masked.
+    const std::string log = g_log.since_mark();
+    EXPECT_NE(log.find("Email=me@example.org&Passwd=****&w=d&service=zuvo"), std::string::npos);
+    EXPECT_NE(log.find("client_id=client-1&client_secret=****&refresh_token=****&grant_type"),
+              std::string::npos);
+    for (const char *secret : {"secret-1", "refresh-1", "Passwd=p"})
+        EXPECT_EQ(log.find(secret), std::string::npos) << secret;
 
     // Without the client's keys a refresh queues nothing.
     g_log.mark();
