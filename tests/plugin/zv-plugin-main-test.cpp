@@ -456,17 +456,14 @@ TEST_F(ClientTest, PausedUploadResumesAndFreedUploadNeverAnswers)
 {
     start_server({"--fault", "kind=data,action=throttle,rate=8000,times=0"});
     const std::string url = create_upload(), other_url = create_upload();
-    ServiceRequest *gone = zv_request_new(); // freed while the server still reads its body
-    zv_set_callback_func(gone, on_answer);
-    zv_set_user_data(gone, &inbox_);
-    zv_set_attr_upload_url(gone, other_url.c_str());
-    zv_set_attr_file_path(gone, clip_.c_str());
-    ASSERT_EQ(zv_request_data_upload(gone), 0);
-    ASSERT_EQ(zv_request_free(gone), 0);
+    auto gone = std::make_unique<Handle>(&inbox_); // freed while the server reads its body
     Handle data(&inbox_);
-    zv_set_attr_upload_url(data.h, url.c_str());
-    zv_set_attr_file_path(data.h, clip_.c_str());
-    ASSERT_EQ(zv_request_data_upload(data.h), 0);
+    for (auto [h, u] : {std::make_pair(gone->h, &other_url), std::make_pair(data.h, &url)}) {
+        zv_set_attr_upload_url(h, u->c_str());
+        zv_set_attr_file_path(h, clip_.c_str());
+        ASSERT_EQ(zv_request_data_upload(h), 0);
+    }
+    gone.reset();
     ASSERT_TRUE(wait_for([&] {
         std::lock_guard<std::mutex> lock(inbox_.mutex);
         return !inbox_.percents.empty();
