@@ -23,7 +23,6 @@
 namespace
 {
 
-const std::string kReset = "<reset>"; // answer: close the connection with a TCP reset
 const std::string kHang = "<hang>";   // answer: say nothing until the server is destroyed
 
 std::string http_answer(const std::string &status, const std::string &headers = "",
@@ -138,11 +137,6 @@ class LoopbackServer
             }
             record(request);
             const std::string &answer = answer_;
-            if (answer == kReset) {
-                linger lg{1, 0};
-                setsockopt(fd, SOL_SOCKET, SO_LINGER, &lg, sizeof lg);
-                break;
-            }
             if (answer == kHang) {
                 std::unique_lock<std::mutex> lock(m_);
                 cv_.wait(lock, [this] { return stop_; });
@@ -450,19 +444,17 @@ TEST_F(EngineTest, ProxyIsUsedUnlessEmptyOrUnspecifiedAddress)
     EXPECT_EQ(target.request_count(), 3u);
 }
 
-// A request without a whole answer is reported once, as no answer: status 0, no data.
+// A request without a whole answer is reported once, as no answer: status 0, no data. (A
+// refused or closed connection the client tests and the cut uploads end to end show.)
 TEST_F(EngineTest, FailedRequestsCompleteWithStatusZeroAndNoData)
 {
-    const std::string closed = LoopbackServer(http_answer("200 OK")).url();
-    LoopbackServer reset(kReset), silent(kHang);
+    LoopbackServer silent(kHang);
     std::string head = "HTTP/1.1 200 OK\r\n";
     while (head.size() < ZV_CURL_MAX_RESPONSE_SIZE + 4096)
         head += "X-Pad: " + std::string(1000, 'p') + "\r\n";
     LoopbackServer big_head(head + "Content-Length: 0\r\n\r\n");
     LoopbackServer big_body(http_answer("200 OK", "", std::string(ZV_CURL_MAX_RESPONSE_SIZE, 'b')));
     const std::pair<const char *, std::string> cases[] = {
-        {"closed port", closed},
-        {"reset", reset.url()},
         {"time-out", silent.url()},
         {"header block past the limit", big_head.url()},
         {"body past the limit (with its NUL)", big_body.url()},
