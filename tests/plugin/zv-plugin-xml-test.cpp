@@ -1,10 +1,6 @@
-// The Atom entry of a metadata upload, byte for byte, and the category document read from a
-// loopback server.
+// The Atom entry of a metadata upload, byte for byte.
 #include <gtest/gtest.h>
 
-#include <map>
-
-#include "zv-plugin-test-server.h"
 #include "zv-plugin-xml.h"
 
 namespace {
@@ -87,49 +83,6 @@ TEST(ComposeTest, DocumentsByteForByte)
                                                   c.position);
         EXPECT_EQ(doc ? doc : "(null)", c.expected) << c.name;
         free(doc);
-    }
-    unsetenv("ZV_DATA_HOST");
-}
-
-TEST(CategoryListTest, LabelsOfCategoryElementsOnly)
-{
-    const std::string path = "/schemas/2007/categories.cat";
-    const std::string labelled =
-        "<?xml version=\"1.0\"?>\n<app:categories xmlns:app=\"http://www.w3.org/2007/app\" "
-        "xmlns:atom=\"http://www.w3.org/2005/Atom\">\n"
-        "  <atom:category term=\"Film\" label=\"Film\"/>\n"
-        "  <!-- a comment -->\n"
-        "  <atom:category term=\"Untitled\"/>\n"
-        "  <atom:term label=\"Not a category\"/>\n"
-        "  <category scheme=\"x\" label=\"Music &amp; Dance\" term=\"Music\"/>\n"
-        "  <atom:category label=\"Sports\"/>\n"
-        "</app:categories>\n";
-    const struct {
-        const char *name;
-        std::map<std::string, std::string> docs;
-        const char *language;
-        std::vector<std::string> expected;
-    } cases[] = {
-        {"document order", {{path, labelled}}, nullptr, {"Film", "Music & Dance", "Sports"}},
-        {"language", {{path + "?hl=de", labelled}}, "de", {"Film", "Music & Dance", "Sports"}},
-        {"other root", {{path, "<feed><category label=\"Film\"/></feed>"}}, nullptr, {}},
-        {"not XML", {{path, "Film, Music"}}, "de", {}},
-        {"no document", {}, nullptr, {}},
-    };
-    for (const auto &c : cases) {
-        // Each GET gets the document registered for its target, any other a 404.
-        zv_plugin_test::LoopbackServer server([&c](const std::string &request) {
-            auto doc = c.docs.find(request.substr(4, request.find(' ', 4) - 4));
-            return doc == c.docs.end() ? zv_plugin_test::http_answer("404 Not Found")
-                                       : zv_plugin_test::http_answer("200 OK", "", doc->second);
-        });
-        setenv("ZV_DATA_HOST", server.host().c_str(), 1);
-        GList *list = zv_plugin_xml_get_category_list(c.language);
-        std::vector<std::string> labels;
-        for (GList *l = list; l; l = l->next)
-            labels.push_back(static_cast<char *>(l->data));
-        g_list_free_full(list, g_free);
-        EXPECT_EQ(labels, c.expected) << c.name;
     }
     unsetenv("ZV_DATA_HOST");
 }
