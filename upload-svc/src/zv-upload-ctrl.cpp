@@ -707,7 +707,6 @@ void zv_upload_ctrl_finalize(AppData *ad)
     }
     g_list_free(ad->job_list);
     ad->job_list = nullptr;
-    zv_ext_util_set_appdata(nullptr);
 }
 
 // ---- Upload sequence ----

@@ -155,13 +155,10 @@ void show_badge_picture(Evas_Object *badge, bool upload)
 
 // A row's badge, badge layout or check box is going away (the row was unrealized, restyled
 // or deleted): the jobs forget it.
-// These deletion callbacks look the application data up when the object goes, not when it
-// was made: the toolkit deletes a window's objects on a later pass of the main loop, after
-// finalize has let the application data go.
-void row_object_del_cb(void *, Evas *, Evas_Object *obj, void *)
+void row_object_del_cb(void *data, Evas *, Evas_Object *obj, void *)
 {
-    AppData *ad = zv_ext_util_get_appdata();
-    for (GList *l = ad ? ad->job_list : nullptr; l; l = l->next) {
+    auto *ad = static_cast<AppData *>(data);
+    for (GList *l = ad->job_list; l; l = l->next) {
         auto *job = static_cast<UploadItem *>(l->data);
         if (!job)
             continue;
@@ -176,17 +173,16 @@ void row_object_del_cb(void *, Evas *, Evas_Object *obj, void *)
 
 void watch_row_object(Evas_Object *obj)
 {
-    if (obj)
-        evas_object_event_callback_add(obj, EVAS_CALLBACK_DEL, row_object_del_cb, nullptr);
+    AppData *ad = zv_ext_util_get_appdata();
+    if (ad && obj)
+        evas_object_event_callback_add(obj, EVAS_CALLBACK_DEL, row_object_del_cb, ad);
 }
 
 // The upload list or the edit list is going away with its rows: the jobs forget their rows
 // of that list and AppData forgets the list.
-void genlist_del_cb(void *, Evas *, Evas_Object *obj, void *)
+void genlist_del_cb(void *data, Evas *, Evas_Object *obj, void *)
 {
-    AppData *ad = zv_ext_util_get_appdata();
-    if (!ad)
-        return;
+    auto *ad = static_cast<AppData *>(data);
     for (GList *l = ad->job_list; l; l = l->next) {
         auto *job = static_cast<UploadItem *>(l->data);
         if (!job)
@@ -202,10 +198,10 @@ void genlist_del_cb(void *, Evas *, Evas_Object *obj, void *)
         ad->pEditGenlist = nullptr;
 }
 
-void nocontent_del_cb(void *, Evas *, Evas_Object *obj, void *)
+void nocontent_del_cb(void *data, Evas *, Evas_Object *obj, void *)
 {
-    AppData *ad = zv_ext_util_get_appdata();
-    if (ad && ad->pNoContent == obj)
+    auto *ad = static_cast<AppData *>(data);
+    if (ad->pNoContent == obj)
         ad->pNoContent = nullptr;
 }
 
@@ -594,7 +590,9 @@ static Evas_Object *_zv_upload_list_create_genlist(Evas_Object *parent)
     elm_genlist_mode_set(genlist, ELM_LIST_COMPRESS);
     elm_genlist_homogeneous_set(genlist, EINA_TRUE);
     elm_scroller_single_direction_set(genlist, ELM_SCROLLER_SINGLE_DIRECTION_HARD);
-    evas_object_event_callback_add(genlist, EVAS_CALLBACK_DEL, genlist_del_cb, nullptr);
+    AppData *ad = zv_ext_util_get_appdata();
+    if (ad)
+        evas_object_event_callback_add(genlist, EVAS_CALLBACK_DEL, genlist_del_cb, ad);
     evas_object_show(genlist);
     return genlist;
 }
@@ -621,7 +619,9 @@ static Evas_Object *_zv_upload_list_create_nocontent_layout(Evas_Object *parent)
     elm_object_signal_emit(inner, "align.center", "elm");
     elm_object_part_content_set(outer, "contents", inner);
 
-    evas_object_event_callback_add(outer, EVAS_CALLBACK_DEL, nocontent_del_cb, nullptr);
+    AppData *ad = zv_ext_util_get_appdata();
+    if (ad)
+        evas_object_event_callback_add(outer, EVAS_CALLBACK_DEL, nocontent_del_cb, ad);
     evas_object_show(outer);
     return outer;
 }
