@@ -11,7 +11,6 @@ namespace
 {
 
 using namespace zv_e2e;
-using zv_upload_test::run_until;
 
 class CtrlE2ETest : public ControllerFixture
 {
@@ -27,12 +26,12 @@ TEST_F(CtrlE2ETest, NetworkEventPausesRunningUploadsAndUploadAgainContinues)
     ASSERT_EQ(ids.size(), 2u);
     start_controller();
     launch();
-    ASSERT_TRUE(run_until([&] { return mid_upload(ids[0]) && mid_upload(ids[1]); }, kLongWaitMs));
+    ASSERT_TRUE(wait_for([&] { return mid_upload(ids[0]) && mid_upload(ids[1]); }, kLongWaitMs));
     ASSERT_TRUE(rows_are(ids, ZV_UPLOAD_STATUS_UPLOADING));
 
     int waiting = record({video("c.mp4", 100000, 13)}, "Waiting").at(0);
     launch();
-    ASSERT_TRUE(run_until([&] { return server_.fired("stall") == 1; }, kLongWaitMs));
+    ASSERT_TRUE(wait_for([&] { return server_.fired("stall") == 1; }, kLongWaitMs));
 
     ASSERT_TRUE(set_key("int", "memory/dnet/status", "2"));
     ASSERT_TRUE(rows_are(ids, ZV_UPLOAD_STATUS_PAUSED));
@@ -88,7 +87,7 @@ TEST_F(CtrlE2ETest, ResumedUploadWithOneReadLeftMovesItsBarToTheEnd)
     values.clear();
     ASSERT_TRUE(server_.clear_faults());
     ad_.resume_upload(&ad_, job(id));
-    ASSERT_TRUE(run_until(
+    ASSERT_TRUE(wait_for(
         [&] {
             watch_bar();
             return stored_rows()[id].status == ZV_UPLOAD_STATUS_COMPLETED;
@@ -108,12 +107,12 @@ TEST_F(CtrlE2ETest, BackgroundCompletionOfTheLastJobEndsTheProcess)
     ASSERT_EQ(ids.size(), 2u);
     start_controller();
     launch();
-    ASSERT_TRUE(run_until([&] { return mid_upload(ids[0]) && mid_upload(ids[1]); }, kLongWaitMs));
+    ASSERT_TRUE(wait_for([&] { return mid_upload(ids[0]) && mid_upload(ids[1]); }, kLongWaitMs));
 
     ad_.exit(&ad_);
     EXPECT_TRUE(ad_.is_paused) << "uploads go on in the background";
     bool ended = false;
-    run_until([] { return false; }, kLongWaitMs, &ended);
+    wait_for([] { return false; }, kLongWaitMs, &ended);
     ASSERT_TRUE(ended) << "the last completion ends the main loop";
     EXPECT_TRUE(rows_in(ids, ZV_UPLOAD_STATUS_COMPLETED));
     EXPECT_TRUE(g_test_log.logged("Not exist running job"));
@@ -184,11 +183,11 @@ TEST_F(CtrlE2ETest, StressOfThirtyJobsWithEventsAtRandomMoments)
         if (!ad_.pCtxPopup)
             return "no menu";
         elm_ctxpopup_item_selected_set(elm_ctxpopup_first_item_get(ad_.pCtxPopup), EINA_TRUE);
-        if (!run_until([&] { return ad_.pEditGenlist && job->edit_gen_item && slid_in; }, 5000))
+        if (!wait_for([&] { return ad_.pEditGenlist && job->edit_gen_item && slid_in; }, 5000))
             return "no edit list";
         // A tap reaches a row on the screen: the list is scrolled to it first.
         elm_genlist_item_show(job->edit_gen_item, ELM_GENLIST_ITEM_SCROLLTO_IN);
-        if (!run_until([&] { return job->check != nullptr; }, 5000))
+        if (!wait_for([&] { return job->check != nullptr; }, 5000))
             return "the row is not shown";
         elm_genlist_item_selected_set(job->edit_gen_item, EINA_TRUE);
         if (!job->checked)
@@ -204,7 +203,7 @@ TEST_F(CtrlE2ETest, StressOfThirtyJobsWithEventsAtRandomMoments)
             evas_object_smart_callback_call(elm_object_part_content_get(popup, "button2"),
                                             "clicked", nullptr);
         deleted.insert(historyid);
-        if (!run_until([&] { return ad_.pEditLayout == nullptr; }, 5000))
+        if (!wait_for([&] { return ad_.pEditLayout == nullptr; }, 5000))
             return "the edit page stays";
         return "";
     };
@@ -217,7 +216,7 @@ TEST_F(CtrlE2ETest, StressOfThirtyJobsWithEventsAtRandomMoments)
 
     std::uniform_int_distribution<int> pause_ms(20, 150), kind(0, 11);
     for (int step = 0; step < 60; ++step) {
-        run_until([] { return false; }, pause_ms(rng));
+        wait_for([] { return false; }, pause_ms(rng));
         int k = kind(rng);
         if (k <= 1) {
             ASSERT_TRUE(set_key("int", "memory/dnet/status", "2"));
@@ -240,7 +239,7 @@ TEST_F(CtrlE2ETest, StressOfThirtyJobsWithEventsAtRandomMoments)
             // A network event at the moment the metadata answers of the new jobs arrive: the
             // first of them turns its job UPLOADING, and the event comes before any upload
             // message is read.
-            run_until(
+            wait_for(
                 [&] {
                     for (int id : more)
                         if (job(id) && job(id)->status == ZV_UPLOAD_STATUS_UPLOADING)
@@ -260,7 +259,7 @@ TEST_F(CtrlE2ETest, StressOfThirtyJobsWithEventsAtRandomMoments)
     for (int id : ids)
         if (!deleted.count(id))
             kept.push_back(id);
-    ASSERT_TRUE(run_until(
+    ASSERT_TRUE(wait_for(
         [&] {
             for (UploadItem *job : jobs_in(ZV_UPLOAD_STATUS_PAUSED))
                 ad_.resume_upload(&ad_, job);
