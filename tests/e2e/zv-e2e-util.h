@@ -27,10 +27,7 @@ using zv_test::Logged;
 using zv_test::run_program;
 using zv_test::Upload;
 using zv_test::wait_for;
-using zv_upload_test::notification;
-using zv_upload_test::set_key;
-using zv_upload_test::set_network;
-using zv_upload_test::stored_rows;
+using namespace zv_upload_test;
 
 constexpr int kLongWaitMs = 60000;
 

@@ -1,9 +1,10 @@
 // Faults injected end to end: the development server cuts, refuses, stalls and floods its
-// answers; another process holds the history locked; the history file and a video go away
+// answers; another connection holds the history locked; the history file and a video go away
 // under the running service. Each fault must leave the job paused (or going on), and the
 // upload again must complete with the server's copy byte-identical: nothing lost.
 #include <algorithm>
 #include <random>
+#include <set>
 
 #include <sqlite3.h>
 
@@ -29,18 +30,53 @@ class FaultE2ETest : public ControllerFixture
         return ids.empty() ? 0 : ids[0];
     }
     bool paused(int id) { return rows_are({id}, ZV_UPLOAD_STATUS_PAUSED); }
-    // Upload again until the job completes; then the server's copy is checked and no data
-    // upload may have sent a byte the server held.
+    // Watches the bar the job's row shows now: every value set on it goes to values_.
+    void watch_bar(int id)
+    {
+        UploadItem *j = job(id);
+        Evas_Object *bar =
+            j && j->gen_item ? elm_object_item_part_content_get(j->gen_item, "elm.icon") : nullptr;
+        if (bar && watched_.insert(bar).second)
+            evas_object_smart_callback_add(
+                bar, "changed",
+                [](void *data, Evas_Object *obj, void *) {
+                    static_cast<std::vector<double> *>(data)->push_back(
+                        elm_progressbar_value_get(obj));
+                },
+                &values_);
+    }
+    // Upload again until the job completes: the server's copy is identical, no data upload sent
+    // a byte the server held, and the bar of a paused job, set back first, was drawn to its end
+    // (even with less than one read of the file left, when the first report only makes the job
+    // UPLOADING).
     void finish(int id)
     {
         ASSERT_TRUE(server_.clear_faults());
+        const bool was_paused = job(id)->status == ZV_UPLOAD_STATUS_PAUSED;
+        watched_.clear();
+        watch_bar(id);
+        for (Evas_Object *bar : watched_)
+            elm_progressbar_value_set(bar, 0.0);
+        values_.clear();
         ad_.resume_upload(&ad_, job(id));
-        ASSERT_TRUE(rows_are({id}, ZV_UPLOAD_STATUS_COMPLETED));
+        ASSERT_TRUE(wait_for(
+            [&] {
+                watch_bar(id);
+                return rows_in({id}, ZV_UPLOAD_STATUS_COMPLETED);
+            },
+            kLongWaitMs));
         expect_identical(id, file_);
         for (const Logged &r : server_.requests())
             EXPECT_NE(r.status, 416) << "a data upload sent bytes the server held";
+        EXPECT_EQ(stored_rows()[id].percent, 100);
+        if (was_paused) {
+            ASSERT_FALSE(values_.empty()) << "the bar never moved after the upload again";
+            EXPECT_DOUBLE_EQ(values_.back(), 1.0);
+        }
     }
 
+    std::set<Evas_Object *> watched_;
+    std::vector<double> values_;
     std::string file_;
 };
 

@@ -52,53 +52,6 @@ TEST_F(CtrlE2ETest, NetworkEventPausesRunningUploadsAndUploadAgainContinues)
     EXPECT_EQ(stored_rows()[ids[0]].percent, 100);
 }
 
-// A resumed upload with less than one read of the file left still moves its bar: its first
-// report only makes the job UPLOADING, the report after the final read draws and stores 100.
-TEST_F(CtrlE2ETest, ResumedUploadWithOneReadLeftMovesItsBarToTheEnd)
-{
-    ASSERT_TRUE(start_server({"kind=data,action=cut,bytes=200000"}));
-    std::string a = video("a.mp4", 600000, 31);
-    int id = record({a}, "Resumed").at(0);
-    start_controller();
-    launch();
-    ASSERT_TRUE(rows_are({id}, ZV_UPLOAD_STATUS_PAUSED));
-
-    // Every value set on the job's bar, whichever bar its row shows.
-    std::vector<double> values;
-    std::set<Evas_Object *> watched;
-    auto watch_bar = [&] {
-        UploadItem *j = job(id);
-        Evas_Object *bar =
-            j && j->gen_item ? elm_object_item_part_content_get(j->gen_item, "elm.icon") : nullptr;
-        if (bar && watched.insert(bar).second)
-            evas_object_smart_callback_add(
-                bar, "changed",
-                [](void *data, Evas_Object *obj, void *) {
-                    static_cast<std::vector<double> *>(data)->push_back(
-                        elm_progressbar_value_get(obj));
-                },
-                &values);
-    };
-    watch_bar();
-    ASSERT_FALSE(watched.empty());
-    // The whole small file went into the socket before the cut, so the bar stands at its end
-    // already: set back, it shows whether the upload again draws at all.
-    elm_progressbar_value_set(*watched.begin(), 0.0);
-    values.clear();
-    ASSERT_TRUE(server_.clear_faults());
-    ad_.resume_upload(&ad_, job(id));
-    ASSERT_TRUE(wait_for(
-        [&] {
-            watch_bar();
-            return stored_rows()[id].status == ZV_UPLOAD_STATUS_COMPLETED;
-        },
-        kLongWaitMs));
-    expect_continued(id, 600000);
-    ASSERT_FALSE(values.empty()) << "the bar never moved after the upload again";
-    EXPECT_DOUBLE_EQ(values.back(), 1.0);
-    EXPECT_EQ(stored_rows()[id].percent, 100);
-}
-
 TEST_F(CtrlE2ETest, BackgroundCompletionOfTheLastJobEndsTheProcess)
 {
     ASSERT_TRUE(start_server({"kind=data,action=throttle,rate=400000,times=0"}));

@@ -203,7 +203,7 @@ TEST_F(ServiceE2ETest, BatchPastTheOpenFileLimitCompletes)
     for (int id = 1; id <= 200; id++) {
         std::string file = video("v" + std::to_string(id) + ".mp4", 20000, 100 + id);
         ASSERT_TRUE(
-            zv_upload_test::add_row(id, ZV_UPLOAD_STATUS_READY, 1.7e9 + id, file.c_str(), "Batch"));
+            add_row(id, ZV_UPLOAD_STATUS_READY, 1.7e9 + id, file.c_str(), "Batch"));
         ids.push_back(id);
     }
     Child &svc = start_service(kBatch, 128);
