@@ -31,7 +31,10 @@ inline pid_t spawn_program(const std::vector<std::string> &argv)
 inline int wait_program(pid_t pid, int timeout_ms = 20000)
 {
     int status = 0;
-    if (!wait_for([&] { return waitpid(pid, &status, WNOHANG) == pid; }, timeout_ms)) {
+    auto ended = [&] {
+        return waitpid(pid, &status, WNOHANG) == pid || reaped_status(pid, &status);
+    };
+    if (!wait_for(ended, timeout_ms)) {
         kill(pid, SIGKILL);
         waitpid(pid, &status, 0);
         return -1;

@@ -40,6 +40,15 @@ std::map<pid_t, int> &reaped_by_loop()
 
 } // namespace
 
+bool reaped_status(pid_t pid, int *status)
+{
+    auto it = reaped_by_loop().find(pid);
+    if (it == reaped_by_loop().end())
+        return false;
+    *status = it->second;
+    return true;
+}
+
 void exec_argv(const std::vector<std::string> &argv)
 {
     std::vector<char *> args;
@@ -79,6 +88,7 @@ bool wait_for(const std::function<bool()> &pred, int timeout_ms, bool *quit_by_o
         double deadline;
         bool held, done;
     } w{&pred, ecore_time_get() + timeout_ms / 1000.0, pred(), false};
+    reaped_by_loop(); // the exit of a child the loop reaps is kept
     if (quit_by_other)
         *quit_by_other = false;
     while (!w.held && ecore_time_get() < w.deadline) {
@@ -207,12 +217,8 @@ bool Child::running()
     pid_t got = waitpid(pid_, &status, WNOHANG);
     if (got == 0 || (got < 0 && errno != ECHILD))
         return true;
-    if (got < 0) { // reaped by the main loop: the status comes with its event
-        auto it = reaped_by_loop().find(pid_);
-        if (it == reaped_by_loop().end())
-            return true;
-        status = it->second;
-    }
+    if (got < 0 && !reaped_status(pid_, &status)) // reaped by the main loop: not yet heard of
+        return true;
     status_ = status;
     exited_ = true;
     return false;

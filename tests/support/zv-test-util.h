@@ -36,6 +36,10 @@ private:
 bool wait_for(const std::function<bool()> &pred, int timeout_ms = 5000,
               bool *quit_by_other = nullptr);
 
+// The wait status of a child that the main loop reaped (it reaps every child of the process
+// while it runs); false when the loop has not reaped it.
+bool reaped_status(pid_t pid, int *status);
+
 // Path of a program built into the build tree's bin folder.
 std::string bin_path(const std::string &program);
 // Path below the source tree.

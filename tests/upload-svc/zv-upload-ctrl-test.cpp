@@ -454,7 +454,8 @@ TEST_F(UploadCtrlTest, RequestsThatFailAtOnceLeaveTheirJobsPaused)
     ASSERT_TRUE(add_row(20, ZV_UPLOAD_STATUS_READY, 20, file.c_str()));
     g_log.mark();
     launch();
-    ASSERT_TRUE(zv_test::wait_for([&] { return stored_rows()[20].status == ZV_UPLOAD_STATUS_PAUSED; }));
+    ASSERT_TRUE(
+        zv_test::wait_for([&] { return stored_rows()[20].status == ZV_UPLOAD_STATUS_PAUSED; }));
     EXPECT_TRUE(g_log.logged("zv_request_meta_upload fail: -998"));
     ad_.resume_upload(&ad_, job(1));
     EXPECT_TRUE(g_log.logged("zv_request_upload_query fail: -998"));
@@ -476,7 +477,8 @@ TEST_F(UploadCtrlTest, StoresThatFailAreMadeAgainAndARowIsOneJob)
     launch();
     EXPECT_EQ(g_list_length(ad_.job_list), 1u) << "the READY row was loaded once";
     sqlite3_exec(other, "COMMIT", nullptr, nullptr, nullptr);
-    EXPECT_TRUE(zv_test::wait_for([] { return stored_rows()[1].status == ZV_UPLOAD_STATUS_WAITING; }));
+    EXPECT_TRUE(
+        zv_test::wait_for([] { return stored_rows()[1].status == ZV_UPLOAD_STATUS_WAITING; }));
 
     // A completion stored while the history is held reaches the row once it is free.
     ASSERT_TRUE(set_network(true));
@@ -487,7 +489,8 @@ TEST_F(UploadCtrlTest, StoresThatFailAreMadeAgainAndARowIsOneJob)
     EXPECT_EQ(j->status, ZV_UPLOAD_STATUS_COMPLETED);
     sqlite3_exec(other, "COMMIT", nullptr, nullptr, nullptr);
     sqlite3_close(other);
-    EXPECT_TRUE(zv_test::wait_for([] { return stored_rows()[2].status == ZV_UPLOAD_STATUS_COMPLETED; }));
+    EXPECT_TRUE(
+        zv_test::wait_for([] { return stored_rows()[2].status == ZV_UPLOAD_STATUS_COMPLETED; }));
 }
 
 } // namespace

@@ -44,8 +44,11 @@ inline std::map<int, StoredRow> stored_rows()
     zv_ext_db_load_full_item_list(&list);
     for (GList *l = list; l; l = l->next) {
         const DbItem *row = static_cast<const DbItem *>(l->data);
-        rows[row->historyid] = {row->status, row->percent, row->filesize,
-                                row->url ? row->url : "", row->userid ? row->userid : "",
+        rows[row->historyid] = {row->status,
+                                row->percent,
+                                row->filesize,
+                                row->url ? row->url : "",
+                                row->userid ? row->userid : "",
                                 row->date};
     }
     if (list)
