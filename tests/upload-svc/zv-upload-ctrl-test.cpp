@@ -159,7 +159,9 @@ TEST_F(UploadCtrlTest, LoadsPutNewestFirstAndTakeReadyRowsAsWaiting)
     ASSERT_TRUE(
         add_row(3, ZV_UPLOAD_STATUS_COMPLETED, 3.0, "/v/three.mp4", "Three", "http://up/3", 100));
     ASSERT_TRUE(add_row(2, ZV_UPLOAD_STATUS_PAUSED, 2.0, "/v/two.mp4", "Two", "http://up/2", 40));
-    start(); // the full load
+    // The full load, before the media database is connected: the rows load without thumbnails.
+    zv_upload_list_load_full_item(&ad_);
+    start();
     EXPECT_EQ(job_ids(), (std::vector<int>{3, 2, 1}));
     auto rows = stored_rows();
     EXPECT_EQ(rows[1].status, ZV_UPLOAD_STATUS_WAITING);
