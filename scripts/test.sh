@@ -96,12 +96,12 @@ if [[ " $stages " == *" tsan "* ]]; then
   # The transfer engine, the service client and the controller, in process and as the real
   # service, with the programs those tests start.
   cmake --build build-tsan -j"$jobs" --target zv-plugin-curl-test zv-plugin-main-test \
-    zv-upload-ctrl-test zv-upload-list-test zv-upload-ctrl-e2e-test zv-upload-svc-e2e-test \
+    zv-upload-ctrl-test zv-upload-ctrl-e2e-test zv-upload-svc-e2e-test \
     zuvo-upload-svc zuvo-devserver zuvo-client zv-vconf zv-keystore zv_resources
   export ZV_COMPANION_TSAN_OPTIONS="halt_on_error=1:suppressions=$top/tests/sanitizers/tsan-companion.supp"
   TSAN_OPTIONS="halt_on_error=1:second_deadlock_stack=1:suppressions=$top/tests/sanitizers/tsan.supp" \
     run_suite "thread: engine, client, controller" build-tsan \
-    -R '^(Engine|ClientTest|AccountTest|CategoryListTest|RunningUploadTest|UploadCtrlTest|UploadListTest|CtrlE2ETest|ServiceE2ETest|Failures/ServiceFailureTest)'
+    -R '^(Engine|ClientTest|AccountTest|CategoryListTest|RunningUploadTest|UploadCtrlTest|CtrlE2ETest|ServiceE2ETest|Failures/ServiceFailureTest)'
   # The stress test again with two more seeds (each run prints its seed in the report).
   for seed in ${ZV_STRESS_SEEDS:-7 4242}; do
     ZV_STRESS_SEED=$seed ZV_LOG_SUFFIX="-stress-$seed" \

@@ -26,7 +26,8 @@ using zv_test::bin_path;
 using zv_test::Logged;
 using zv_test::run_program;
 using zv_test::Upload;
-using zv_upload_test::stored_rows;
+using zv_test::wait_for;
+using namespace zv_upload_test;
 
 constexpr int kLongWaitMs = 60000;
 
@@ -50,20 +51,6 @@ inline std::vector<int> record(const std::vector<std::string> &files, const std:
     for (std::string line; std::getline(in, line);)
         ids.push_back(atoi(line.c_str()));
     return ids;
-}
-
-inline bool set_key(const char *type, const std::string &key, const std::string &value)
-{
-    return run_program({bin_path("zv-vconf"), "set", "-t", type, key, value}) == 0;
-}
-
-// The network keys of a working Wi-Fi connection (or none).
-inline bool set_network(bool up)
-{
-    return set_key("int", "memory/dnet/status", up ? "2" : "0") &&
-           set_key("int", "memory/dnet/network_config", up ? "1" : "0") &&
-           set_key("string", "memory/dnet/ip", "127.0.0.1") &&
-           set_key("string", "memory/dnet/proxy", "");
 }
 
 // A working network and API key, the history of a temporary folder, and the server.
@@ -112,7 +99,7 @@ class E2ETest : public ::testing::Test
     }
     bool rows_are(const std::vector<int> &ids, int status, int timeout_ms = kLongWaitMs)
     {
-        return zv_upload_test::run_until([&] { return rows_in(ids, status); }, timeout_ms);
+        return wait_for([&] { return rows_in(ids, status); }, timeout_ms);
     }
     // The server's upload of the row, once the row has its upload address.
     Upload upload_of(int historyid) { return server_.upload_of_url(stored_rows()[historyid].url); }

@@ -11,7 +11,6 @@ namespace
 {
 
 using namespace zv_e2e;
-using zv_upload_test::run_until;
 
 class CtrlE2ETest : public ControllerFixture
 {
@@ -27,12 +26,12 @@ TEST_F(CtrlE2ETest, NetworkEventPausesRunningUploadsAndUploadAgainContinues)
     ASSERT_EQ(ids.size(), 2u);
     start_controller();
     launch();
-    ASSERT_TRUE(run_until([&] { return mid_upload(ids[0]) && mid_upload(ids[1]); }, kLongWaitMs));
+    ASSERT_TRUE(wait_for([&] { return mid_upload(ids[0]) && mid_upload(ids[1]); }, kLongWaitMs));
     ASSERT_TRUE(rows_are(ids, ZV_UPLOAD_STATUS_UPLOADING));
 
     int waiting = record({video("c.mp4", 100000, 13)}, "Waiting").at(0);
     launch();
-    ASSERT_TRUE(run_until([&] { return server_.fired("stall") == 1; }, kLongWaitMs));
+    ASSERT_TRUE(wait_for([&] { return server_.fired("stall") == 1; }, kLongWaitMs));
 
     ASSERT_TRUE(set_key("int", "memory/dnet/status", "2"));
     ASSERT_TRUE(rows_are(ids, ZV_UPLOAD_STATUS_PAUSED));
@@ -53,53 +52,6 @@ TEST_F(CtrlE2ETest, NetworkEventPausesRunningUploadsAndUploadAgainContinues)
     EXPECT_EQ(stored_rows()[ids[0]].percent, 100);
 }
 
-// A resumed upload with less than one read of the file left still moves its bar: its first
-// report only makes the job UPLOADING, the report after the final read draws and stores 100.
-TEST_F(CtrlE2ETest, ResumedUploadWithOneReadLeftMovesItsBarToTheEnd)
-{
-    ASSERT_TRUE(start_server({"kind=data,action=cut,bytes=200000"}));
-    std::string a = video("a.mp4", 600000, 31);
-    int id = record({a}, "Resumed").at(0);
-    start_controller();
-    launch();
-    ASSERT_TRUE(rows_are({id}, ZV_UPLOAD_STATUS_PAUSED));
-
-    // Every value set on the job's bar, whichever bar its row shows.
-    std::vector<double> values;
-    std::set<Evas_Object *> watched;
-    auto watch_bar = [&] {
-        UploadItem *j = job(id);
-        Evas_Object *bar =
-            j && j->gen_item ? elm_object_item_part_content_get(j->gen_item, "elm.icon") : nullptr;
-        if (bar && watched.insert(bar).second)
-            evas_object_smart_callback_add(
-                bar, "changed",
-                [](void *data, Evas_Object *obj, void *) {
-                    static_cast<std::vector<double> *>(data)->push_back(
-                        elm_progressbar_value_get(obj));
-                },
-                &values);
-    };
-    watch_bar();
-    ASSERT_FALSE(watched.empty());
-    // The whole small file went into the socket before the cut, so the bar stands at its end
-    // already: set back, it shows whether the upload again draws at all.
-    elm_progressbar_value_set(*watched.begin(), 0.0);
-    values.clear();
-    ASSERT_TRUE(server_.clear_faults());
-    ad_.resume_upload(&ad_, job(id));
-    ASSERT_TRUE(run_until(
-        [&] {
-            watch_bar();
-            return stored_rows()[id].status == ZV_UPLOAD_STATUS_COMPLETED;
-        },
-        kLongWaitMs));
-    expect_continued(id, 600000);
-    ASSERT_FALSE(values.empty()) << "the bar never moved after the upload again";
-    EXPECT_DOUBLE_EQ(values.back(), 1.0);
-    EXPECT_EQ(stored_rows()[id].percent, 100);
-}
-
 TEST_F(CtrlE2ETest, BackgroundCompletionOfTheLastJobEndsTheProcess)
 {
     ASSERT_TRUE(start_server({"kind=data,action=throttle,rate=400000,times=0"}));
@@ -108,12 +60,12 @@ TEST_F(CtrlE2ETest, BackgroundCompletionOfTheLastJobEndsTheProcess)
     ASSERT_EQ(ids.size(), 2u);
     start_controller();
     launch();
-    ASSERT_TRUE(run_until([&] { return mid_upload(ids[0]) && mid_upload(ids[1]); }, kLongWaitMs));
+    ASSERT_TRUE(wait_for([&] { return mid_upload(ids[0]) && mid_upload(ids[1]); }, kLongWaitMs));
 
     ad_.exit(&ad_);
     EXPECT_TRUE(ad_.is_paused) << "uploads go on in the background";
     bool ended = false;
-    run_until([] { return false; }, kLongWaitMs, &ended);
+    wait_for([] { return false; }, kLongWaitMs, &ended);
     ASSERT_TRUE(ended) << "the last completion ends the main loop";
     EXPECT_TRUE(rows_in(ids, ZV_UPLOAD_STATUS_COMPLETED));
     EXPECT_TRUE(g_test_log.logged("Not exist running job"));
@@ -184,11 +136,11 @@ TEST_F(CtrlE2ETest, StressOfThirtyJobsWithEventsAtRandomMoments)
         if (!ad_.pCtxPopup)
             return "no menu";
         elm_ctxpopup_item_selected_set(elm_ctxpopup_first_item_get(ad_.pCtxPopup), EINA_TRUE);
-        if (!run_until([&] { return ad_.pEditGenlist && job->edit_gen_item && slid_in; }, 5000))
+        if (!wait_for([&] { return ad_.pEditGenlist && job->edit_gen_item && slid_in; }, 5000))
             return "no edit list";
         // A tap reaches a row on the screen: the list is scrolled to it first.
         elm_genlist_item_show(job->edit_gen_item, ELM_GENLIST_ITEM_SCROLLTO_IN);
-        if (!run_until([&] { return job->check != nullptr; }, 5000))
+        if (!wait_for([&] { return job->check != nullptr; }, 5000))
             return "the row is not shown";
         elm_genlist_item_selected_set(job->edit_gen_item, EINA_TRUE);
         if (!job->checked)
@@ -204,7 +156,7 @@ TEST_F(CtrlE2ETest, StressOfThirtyJobsWithEventsAtRandomMoments)
             evas_object_smart_callback_call(elm_object_part_content_get(popup, "button2"),
                                             "clicked", nullptr);
         deleted.insert(historyid);
-        if (!run_until([&] { return ad_.pEditLayout == nullptr; }, 5000))
+        if (!wait_for([&] { return ad_.pEditLayout == nullptr; }, 5000))
             return "the edit page stays";
         return "";
     };
@@ -217,7 +169,7 @@ TEST_F(CtrlE2ETest, StressOfThirtyJobsWithEventsAtRandomMoments)
 
     std::uniform_int_distribution<int> pause_ms(20, 150), kind(0, 11);
     for (int step = 0; step < 60; ++step) {
-        run_until([] { return false; }, pause_ms(rng));
+        wait_for([] { return false; }, pause_ms(rng));
         int k = kind(rng);
         if (k <= 1) {
             ASSERT_TRUE(set_key("int", "memory/dnet/status", "2"));
@@ -240,7 +192,7 @@ TEST_F(CtrlE2ETest, StressOfThirtyJobsWithEventsAtRandomMoments)
             // A network event at the moment the metadata answers of the new jobs arrive: the
             // first of them turns its job UPLOADING, and the event comes before any upload
             // message is read.
-            run_until(
+            wait_for(
                 [&] {
                     for (int id : more)
                         if (job(id) && job(id)->status == ZV_UPLOAD_STATUS_UPLOADING)
@@ -260,7 +212,7 @@ TEST_F(CtrlE2ETest, StressOfThirtyJobsWithEventsAtRandomMoments)
     for (int id : ids)
         if (!deleted.count(id))
             kept.push_back(id);
-    ASSERT_TRUE(run_until(
+    ASSERT_TRUE(wait_for(
         [&] {
             for (UploadItem *job : jobs_in(ZV_UPLOAD_STATUS_PAUSED))
                 ad_.resume_upload(&ad_, job);

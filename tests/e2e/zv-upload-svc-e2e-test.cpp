@@ -17,8 +17,6 @@ namespace
 
 using namespace zv_e2e;
 using zv_test::Child;
-using zv_test::wait_for;
-using zv_upload_test::notification;
 
 const zv_test::Env kBatch = {{"ZV_DATA_ACCESS_TOKEN", "dev-token"},
                              {"ZV_DATA_CATEGORY", "People"},
@@ -128,7 +126,7 @@ TEST_F(ServiceE2ETest, LaterLaunchesAddRowsAndTerminationWritesRowsBack)
     EXPECT_EQ(rows[first].status, ZV_UPLOAD_STATUS_PAUSED);
     EXPECT_EQ(rows[second].status, ZV_UPLOAD_STATUS_COMPLETED);
     EXPECT_EQ(rows[third].status, ZV_UPLOAD_STATUS_READY);
-    EXPECT_TRUE(notification(dir_.file("run"), "zuvo_ongoing_noti").empty());
+    EXPECT_TRUE(notification("zuvo_ongoing_noti").empty());
     // The running upload went on undisturbed: one data upload, logged once it ended.
     auto data_uploads = [&] {
         int n = 0;
@@ -205,7 +203,7 @@ TEST_F(ServiceE2ETest, BatchPastTheOpenFileLimitCompletes)
     for (int id = 1; id <= 200; id++) {
         std::string file = video("v" + std::to_string(id) + ".mp4", 20000, 100 + id);
         ASSERT_TRUE(
-            zv_upload_test::add_row(id, ZV_UPLOAD_STATUS_READY, 1.7e9 + id, file.c_str(), "Batch"));
+            add_row(id, ZV_UPLOAD_STATUS_READY, 1.7e9 + id, file.c_str(), "Batch"));
         ids.push_back(id);
     }
     Child &svc = start_service(kBatch, 128);
@@ -226,8 +224,8 @@ TEST_F(ServiceE2ETest, BatchPastTheOpenFileLimitCompletes)
     EXPECT_FALSE(logged("Too many open files"));
     std::string run = dir_.file("run");
     ASSERT_TRUE(
-        wait_for([&] { return notification(run, "zuvo_ongoing_noti").empty(); }, kLongWaitMs));
-    auto complete = notification(run, "zuvo_complete_noti");
+        wait_for([&] { return notification("zuvo_ongoing_noti").empty(); }, kLongWaitMs));
+    auto complete = notification("zuvo_complete_noti");
     EXPECT_NE(complete["title"].find("200"), std::string::npos) << complete["title"];
     EXPECT_FALSE(complete["content"].empty());
 
@@ -285,7 +283,7 @@ TEST_P(ServiceFailureTest, RowEndsAsExpectedWithItsMessage)
     if (c.status == ZV_UPLOAD_STATUS_WAITING) {
         // The launch request has run once the ongoing notification is up.
         ASSERT_TRUE(
-            wait_for([&] { return !notification(dir_.file("run"), "zuvo_ongoing_noti").empty(); },
+            wait_for([&] { return !notification("zuvo_ongoing_noti").empty(); },
                      kLongWaitMs));
     } else {
         ASSERT_TRUE(rows_are({id}, c.status));

@@ -12,12 +12,10 @@
 #include <sys/wait.h>
 #include <unistd.h>
 
-#include <chrono>
 #include <filesystem>
 #include <fstream>
 #include <map>
 #include <sstream>
-#include <thread>
 
 namespace zv_test {
 
@@ -41,6 +39,15 @@ std::map<pid_t, int> &reaped_by_loop()
 }
 
 } // namespace
+
+bool reaped_status(pid_t pid, int *status)
+{
+    auto it = reaped_by_loop().find(pid);
+    if (it == reaped_by_loop().end())
+        return false;
+    *status = it->second;
+    return true;
+}
 
 void exec_argv(const std::vector<std::string> &argv)
 {
@@ -74,16 +81,41 @@ TempDir::~TempDir()
         std::filesystem::remove_all(path_, ignored);
 }
 
-bool wait_for(const std::function<bool()> &pred, int timeout_ms)
+bool wait_for(const std::function<bool()> &pred, int timeout_ms, bool *quit_by_other)
 {
-    auto deadline = std::chrono::steady_clock::now() + std::chrono::milliseconds(timeout_ms);
-    while (!pred()) {
-        if (std::chrono::steady_clock::now() >= deadline)
-            return pred();
-        ecore_main_loop_iterate();
-        std::this_thread::sleep_for(std::chrono::milliseconds(2));
+    struct Wait {
+        const std::function<bool()> *pred;
+        double deadline;
+        bool held, done;
+    } w{&pred, ecore_time_get() + timeout_ms / 1000.0, pred(), false};
+    reaped_by_loop(); // the exit of a child the loop reaps is kept
+    if (quit_by_other)
+        *quit_by_other = false;
+    while (!w.held && ecore_time_get() < w.deadline) {
+        Ecore_Timer *timer = ecore_timer_add(
+            0.01,
+            [](void *data) -> Eina_Bool {
+                Wait *w = static_cast<Wait *>(data);
+                w->held = (*w->pred)();
+                if (!w->held && ecore_time_get() < w->deadline)
+                    return ECORE_CALLBACK_RENEW;
+                w->done = true;
+                ecore_main_loop_quit();
+                return ECORE_CALLBACK_CANCEL;
+            },
+            &w);
+        ecore_main_loop_begin();
+        if (w.done)
+            break;
+        // Something else (elm_exit) ended the loop: the caller hears of it, or the wait goes on.
+        ecore_timer_del(timer);
+        w.held = pred();
+        if (quit_by_other) {
+            *quit_by_other = true;
+            break;
+        }
     }
-    return true;
+    return w.held;
 }
 
 std::string bin_path(const std::string &program)
@@ -185,12 +217,8 @@ bool Child::running()
     pid_t got = waitpid(pid_, &status, WNOHANG);
     if (got == 0 || (got < 0 && errno != ECHILD))
         return true;
-    if (got < 0) { // reaped by the main loop: the status comes with its event
-        auto it = reaped_by_loop().find(pid_);
-        if (it == reaped_by_loop().end())
-            return true;
-        status = it->second;
-    }
+    if (got < 0 && !reaped_status(pid_, &status)) // reaped by the main loop: not yet heard of
+        return true;
     status_ = status;
     exited_ = true;
     return false;

@@ -30,8 +30,15 @@ private:
     std::string path_;
 };
 
-// Runs the main loop (ecore iterations) until pred() holds or timeout_ms passes.
-bool wait_for(const std::function<bool()> &pred, int timeout_ms = 5000);
+// Runs the main loop as the application does (idlers and timers fire) until pred() holds or
+// timeout_ms passes; true when pred() holds. When something else (elm_exit) ends the loop, the
+// wait ends there if quit_by_other is given (and *quit_by_other tells), else it goes on.
+bool wait_for(const std::function<bool()> &pred, int timeout_ms = 5000,
+              bool *quit_by_other = nullptr);
+
+// The wait status of a child that the main loop reaped (it reaps every child of the process
+// while it runs); false when the loop has not reaped it.
+bool reaped_status(pid_t pid, int *status);
 
 // Path of a program built into the build tree's bin folder.
 std::string bin_path(const std::string &program);

@@ -20,8 +20,7 @@
 #include <string>
 #include <vector>
 
-#include "zv-ext-db.h"
-#include "zv-test-util.h"
+#include "../upload-svc/zv-upload-test-util.h"
 
 namespace
 {
@@ -91,21 +90,10 @@ TEST_F(ZuvoClientTest, AddListRemoveRoundTrip)
     EXPECT_EQ(out, "3\t" + tmp_.file("b.mov") + "\n");
 
     ASSERT_EQ(zv_ext_db_open(), 1);
-    GList *list = nullptr;
-    ASSERT_EQ(zv_ext_db_load_full_item_list(&list), 1);
-    ASSERT_EQ(g_list_length(list), 3u);
-    auto *first = static_cast<DbItem *>(list->data);
-    auto *second = static_cast<DbItem *>(list->next->data);
-    EXPECT_EQ(first->historyid, 1);
-    EXPECT_STREQ(first->title, "clip.one");
-    EXPECT_STREQ(first->filename, tmp_.file("clip.one.mp4").c_str());
-    EXPECT_EQ(first->filesize, 10);
-    EXPECT_STREQ(first->userid, "me");
-    EXPECT_EQ(first->status, ZV_UPLOAD_STATUS_READY);
-    EXPECT_EQ(first->url, nullptr);
-    EXPECT_LT(first->date, second->date);
-    EXPECT_EQ(second->filesize, 5000000000LL);
-    zv_ext_db_free_item_list(list);
+    auto stored = zv_upload_test::stored_rows();
+    EXPECT_EQ(stored[1].userid, "me");
+    EXPECT_EQ(stored[1].url, "");
+    EXPECT_LT(stored[1].date, stored[2].date);
     DbItem progress{};
     progress.historyid = 2;
     progress.percent = 40;
@@ -117,8 +105,8 @@ TEST_F(ZuvoClientTest, AddListRemoveRoundTrip)
     ASSERT_EQ(rows.size(), 3u);
     EXPECT_EQ(rows["1"], (std::vector<std::string>{"1", "clip.one", "READY", "0%", "10",
                                                    tmp_.file("clip.one.mp4")}));
-    EXPECT_EQ(rows["2"][2], "UPLOADING");
-    EXPECT_EQ(rows["2"][3], "40%");
+    EXPECT_EQ(rows["2"], (std::vector<std::string>{"2", "b", "UPLOADING", "40%", "5000000000",
+                                                   tmp_.file("b.mov")}));
     EXPECT_EQ(rows["3"][1], "Take");
 
     // Registered in the media database under its file name.

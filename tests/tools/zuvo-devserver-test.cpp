@@ -43,10 +43,6 @@ protected:
     {
         return http("PUT", url, {"Content-Range: " + range}, body);
     }
-    Reply admin_fault(const std::string &query)
-    {
-        return http("POST", server_.url("/_admin/fault?" + query));
-    }
 
     zv_test::TempDir dir_{false};
     zv_test::DevServer server_;
@@ -103,7 +99,7 @@ TEST_F(DevServerTest, FaultsByAdminRequest)
 {
     start();
     // The second metadata upload from now is answered 500, the third has no Location.
-    ASSERT_EQ(admin_fault("kind=meta&action=status&status=500&nth=2").status, 201);
+    ASSERT_TRUE(server_.add_fault("kind=meta&action=status&status=500&nth=2"));
     ASSERT_EQ(http("POST", server_.url("/_admin/fault"), {"Content-Type: application/json"},
                    "{\"kind\": \"meta\", \"action\": \"nolocation\", \"nth\": 3}")
                   .status,
@@ -118,11 +114,11 @@ TEST_F(DevServerTest, FaultsByAdminRequest)
 
     // A throttled PUT still stores every byte.
     std::string url = four.header("Location");
-    ASSERT_EQ(admin_fault("kind=data&action=throttle&rate=400000").status, 201);
+    ASSERT_TRUE(server_.add_fault("kind=data&action=throttle&rate=400000"));
     EXPECT_EQ(put(url, "bytes 0-39999/40000", pattern(40000)).status, 201);
     EXPECT_EQ(server_.stored(url.substr(url.rfind('/') + 1)), pattern(40000));
 
-    Reply bad = admin_fault("kind=data&action=cut");
+    Reply bad = http("POST", server_.url("/_admin/fault?kind=data&action=cut"));
     EXPECT_EQ(bad.status, 400);
     EXPECT_NE(bad.body.find("bytes"), std::string::npos);
     std::string rules = http("GET", server_.url("/_admin/faults")).body;
