@@ -7,7 +7,9 @@
 #   3. the engine, client and controller tests, the stress test among them, under
 #      ThreadSanitizer (build-tsan/),
 #   4. every fuzz target for a few seconds on its seed corpus (build-fuzz/, clang),
-# and prints one reliability report at the end. CI=true turns warnings into errors.
+# and prints one reliability report at the end. It fails when the tests grow past 0.45 of the
+# product's lines (scripts/test-size.sh; the ceiling comes down as tests are merged).
+# CI=true turns warnings into errors.
 # ZV_TEST_STAGES picks stages (default "plain asan tsan fuzz").
 set -euo pipefail
 cd "$(dirname "$0")/.."
@@ -35,6 +37,13 @@ export ZV_REPORT_DIR="$top/build/report"
 rm -rf "$ZV_REPORT_DIR"
 mkdir -p "$ZV_REPORT_DIR"
 status=0
+
+# The tests may not grow past the product's size times this ratio (the figures are in the
+# report). It only ever comes down, towards a third, as tests are merged.
+size_max=0.45
+if ! bash scripts/test-size.sh --max "$size_max" >"$ZV_REPORT_DIR/size.txt" 2>&1; then
+  status=1
+fi
 
 # Runs ctest in a build folder; one report line with the counts.
 run_suite() {
@@ -101,7 +110,7 @@ if [[ " $stages " == *" tsan "* ]]; then
   export ZV_COMPANION_TSAN_OPTIONS="halt_on_error=1:suppressions=$top/tests/sanitizers/tsan-companion.supp"
   TSAN_OPTIONS="halt_on_error=1:second_deadlock_stack=1:suppressions=$top/tests/sanitizers/tsan.supp" \
     run_suite "thread: engine, client, controller" build-tsan \
-    -R '^(Engine|ClientTest|AccountTest|CategoryListTest|RunningUploadTest|UploadCtrlTest|CtrlE2ETest|ServiceE2ETest|Failures/ServiceFailureTest)'
+    -R '^(Engine|ClientTest|AccountTest|RunningUploadTest|UploadCtrlTest|CtrlE2ETest|ServiceE2ETest|Failures/ServiceFailureTest)'
   # The stress test again with two more seeds (each run prints its seed in the report).
   for seed in ${ZV_STRESS_SEEDS:-7 4242}; do
     ZV_STRESS_SEED=$seed ZV_LOG_SUFFIX="-stress-$seed" \
@@ -120,23 +129,12 @@ fi
 echo
 echo "== reliability report"
 # Tests that skip themselves for want of room write why to skipped.txt.
-for part in sanitizers stress faults fuzz skipped; do
+for part in size sanitizers fuzz skipped; do
   if [ -s "$ZV_REPORT_DIR/$part.txt" ]; then
     echo "-- $part"
     cat "$ZV_REPORT_DIR/$part.txt"
   fi
 done
-# Every build runs the fault scenarios: the total is over all of them.
-if [ -s "$ZV_REPORT_DIR/faults.txt" ]; then
-  faults=$(sed -n 's/.*: \([0-9]*\) injected, \([0-9]*\) survived$/\1 \2/p' "$ZV_REPORT_DIR/faults.txt" |
-    awk '{ i += $1; s += $2 }
-      END { printf "faults in all: %d injected, %d survived; %s\n", i, s,
-            (i == s && i > 0 ? "nothing lost" : "SOME LOST") }')
-  echo "$faults"
-  if [[ "$faults" == *"SOME LOST"* ]]; then
-    status=1
-  fi
-fi
 if [ "$status" = 0 ]; then
   echo "all stages passed"
 else

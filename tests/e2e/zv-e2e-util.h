@@ -182,7 +182,7 @@ class ControllerFixture : public E2ETest
     }
     UploadItem *job(int historyid) { return _zv_upload_ctrl_find_item_by_id(&ad_, historyid); }
 
-    AppData ad_ = {};
+    AppData &ad_ = process_appdata();
     bool started_ = false;
 };
 

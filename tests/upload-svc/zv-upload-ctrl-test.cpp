@@ -147,7 +147,7 @@ class UploadCtrlTest : public ::testing::Test
 
     zv_test::TempDir dir_;
     SilentServer silent_;
-    AppData ad_ = {};
+    AppData &ad_ = process_appdata();
     bool started_ = false;
 };
 

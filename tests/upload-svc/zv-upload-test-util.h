@@ -9,9 +9,20 @@
 
 #include "zv-ext-db.h"
 #include "zv-test-util.h"
+#include "zv-upload-main.h"
 
 namespace zv_upload_test
 {
+
+// The process's one application context, zero-filled for each fixture: the controller
+// publishes the first one it is given for the life of the process, as the application has
+// one, so a fixture of its own would leave a freed one published to the next test.
+inline AppData &process_appdata()
+{
+    static AppData ad;
+    ad = AppData{};
+    return ad;
+}
 
 inline bool add_row(int historyid, int status, double date, const char *filename,
                     const char *title = "Clip", const char *url = nullptr, int percent = 0)
