@@ -335,6 +335,18 @@ TEST_F(ViewTest, BadgesMenuAndKeys)
     }
     elm_genlist_item_selected_set(job->gen_item, EINA_TRUE);
     EXPECT_FALSE(elm_genlist_item_selected_get(job->gen_item));
+    // A row class called without a job or a part answers nothing.
+    auto answers_nothing = [&](Elm_Object_Item *item) {
+        const Elm_Genlist_Item_Class *itc = elm_genlist_item_item_class_get(item);
+        Evas_Object *list = elm_object_item_widget_get(item);
+        for (const char *part : {"elm.text.main", "elm.icon.1"}) {
+            EXPECT_EQ(itc->func.text_get(nullptr, list, part), nullptr);
+            EXPECT_EQ(itc->func.content_get(nullptr, list, part), nullptr);
+        }
+        EXPECT_EQ(itc->func.text_get(job, list, nullptr), nullptr);
+        EXPECT_EQ(itc->func.content_get(job, list, nullptr), nullptr);
+    };
+    answers_nothing(job->gen_item);
 
     int w = 0, h = 0;
     elm_win_screen_size_get(ad->win, nullptr, nullptr, &w, &h);
@@ -364,6 +376,7 @@ TEST_F(ViewTest, BadgesMenuAndKeys)
     zv_upload_list_complete_item(job);
     EXPECT_EQ(style_of(job->gen_item), kComplete);
     EXPECT_TRUE(wait_for([&] { return sub_text(job->gen_item).empty(); }));
+    answers_nothing(job->gen_item);
 }
 
 // Edit mode as a user goes through it: Cancel and the back key leave it without deleting;
