@@ -134,8 +134,15 @@ TEST_F(FaultE2ETest, StatusQueryFaultsLeaveTheJobPaused)
         ASSERT_TRUE(paused(id));
         ASSERT_TRUE(server_.add_fault(f.rule));
         ad_.resume_upload(&ad_, job(id));
+        ASSERT_EQ(job(id)->status, ZV_UPLOAD_STATUS_UPLOADING);
         ASSERT_TRUE(wait_for([&] { return server_.fired(f.action) == 1; }, kLongWaitMs));
-        ASSERT_TRUE(rows_are({id}, ZV_UPLOAD_STATUS_PAUSED, f.wait_ms));
+        // The stored row said PAUSED all along: the job itself must pause again.
+        ASSERT_TRUE(wait_for(
+            [&] {
+                return job(id)->status == ZV_UPLOAD_STATUS_PAUSED &&
+                       rows_in({id}, ZV_UPLOAD_STATUS_PAUSED);
+            },
+            f.wait_ms));
         finish(id);
     }
 }
