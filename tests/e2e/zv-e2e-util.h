@@ -67,10 +67,11 @@ class E2ETest : public ::testing::Test
     }
     void TearDown() override { zv_ext_db_close(); }
 
-    // Starts the server with these fault rules and points this process's hosts at it.
+    // Starts the server with these fault rules and points this process's hosts at it. It
+    // takes only the token and the API key the tests give the service.
     bool start_server(const std::vector<std::string> &faults = {})
     {
-        std::vector<std::string> args;
+        std::vector<std::string> args = {"--token", "dev-token", "--api-key", "dev-key"};
         for (const auto &f : faults)
             args.insert(args.end(), {"--fault", f});
         if (!server_.start(dir_.file("server"), args))
