@@ -12,6 +12,7 @@
 #include <sys/wait.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <filesystem>
 #include <fstream>
 #include <map>
@@ -49,13 +50,27 @@ bool reaped_status(pid_t pid, int *status)
     return true;
 }
 
-void exec_argv(const std::vector<std::string> &argv)
+Exec::Exec(const std::vector<std::string> &argv, const Env &env)
 {
-    std::vector<char *> args;
+    for (char **e = environ; *e; ++e) {
+        const std::string entry = *e;
+        const std::string name = entry.substr(0, entry.find('='));
+        if (std::none_of(env.begin(), env.end(), [&](const auto &kv) { return kv.first == name; }))
+            env_.push_back(entry);
+    }
+    for (const auto &kv : env)
+        env_.push_back(kv.first + "=" + kv.second);
     for (const auto &a : argv)
-        args.push_back(const_cast<char *>(a.c_str()));
-    args.push_back(nullptr);
-    execv(args[0], args.data());
+        argv_.push_back(const_cast<char *>(a.c_str()));
+    argv_.push_back(nullptr);
+    for (auto &e : env_)
+        envp_.push_back(e.data());
+    envp_.push_back(nullptr);
+}
+
+void Exec::run() const
+{
+    execve(argv_[0], argv_.data(), envp_.data());
     _exit(127);
 }
 
@@ -135,13 +150,14 @@ pid_t spawn_piped(const std::vector<std::string> &argv, int *input, int *output)
     int in[2] = {-1, -1}, out[2] = {-1, -1};
     if ((input && pipe2(in, O_CLOEXEC) != 0) || (output && pipe2(out, O_CLOEXEC) != 0))
         return -1;
+    const Exec exec(argv);
     pid_t pid = fork();
     if (pid == 0) {
         if (input)
             dup2(in[0], 0);
         if (output)
             dup2(out[1], 1);
-        exec_argv(argv);
+        exec.run();
     }
     close(in[0]);
     close(out[1]);
@@ -186,6 +202,8 @@ bool Child::start(const std::vector<std::string> &argv, const std::string &out_p
 {
     reaped_by_loop();
     killed_ = false;
+    const Exec exec(argv, env);
+    const rlimit limit = {nofile, nofile};
     pid_ = fork();
     if (pid_ < 0)
         return false;
@@ -198,12 +216,9 @@ bool Child::start(const std::vector<std::string> &argv, const std::string &out_p
             dup2(out, 1);
             dup2(out, 2);
         }
-        for (const auto &kv : env)
-            setenv(kv.first.c_str(), kv.second.c_str(), 1);
-        rlimit limit = {nofile, nofile};
         if (nofile > 0 && setrlimit(RLIMIT_NOFILE, &limit) != 0)
             _exit(126);
-        exec_argv(argv);
+        exec.run();
     }
     exited_ = false;
     return true;

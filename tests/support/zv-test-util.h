@@ -45,8 +45,21 @@ std::string bin_path(const std::string &program);
 // Path below the source tree.
 std::string source_path(const std::string &rel);
 
-// In a forked child: executes argv (argv[0] a path), or exits 127.
-[[noreturn]] void exec_argv(const std::vector<std::string> &argv);
+using Env = std::vector<std::pair<std::string, std::string>>;
+
+// What a forked child executes: argv (argv[0] a path) with this process's environment and env
+// over it. The arrays are made before the fork: a child of a process with other threads must
+// not allocate before exec, since another thread may have held the allocator's lock at the fork.
+class Exec {
+public:
+    explicit Exec(const std::vector<std::string> &argv, const Env &env = {});
+    // In the forked child: executes, or exits 127.
+    [[noreturn]] void run() const;
+
+private:
+    std::vector<std::string> env_;
+    std::vector<char *> argv_, envp_;
+};
 
 // Starts argv (argv[0] a path) with its standard input (*input: the write end) and output
 // (*output: the read end) on pipes, or inherited where null; the pid, or -1.
@@ -60,8 +73,6 @@ int run_program(const std::vector<std::string> &argv, const std::string &input =
 // A listening TCP socket on 127.0.0.1 with a port of the system's choosing; -1 on failure.
 // *port receives the port.
 int listen_loopback(int *port, int backlog = 8);
-
-using Env = std::vector<std::pair<std::string, std::string>>;
 
 // A child process whose exit status is never lost, even when the toolkit's main loop reaps it
 // (it reaps every child of the process while it iterates). Standard output and error go to
