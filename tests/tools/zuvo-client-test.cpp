@@ -1,6 +1,6 @@
 // Tests of the companion client program, run from the build against a fresh history, media
-// database and runtime folder; its launch requests go to a listener standing in for the
-// running service.
+// database and runtime folder; its launch requests go to the probe application running as
+// the instance (or, with none running, start the service itself).
 #include <app.h>
 #include <gtest/gtest.h>
 #include <signal.h>
@@ -225,12 +225,13 @@ TEST_F(ZuvoClientTest, TokenStaysOffTheCommandLinesOfClientAndService)
     ucred cred = {};
     socklen_t len = sizeof cred;
     ASSERT_EQ(getsockopt(fd, SOL_SOCKET, SO_PEERCRED, &cred, &len), 0);
-    close(fd);
     std::string service_cmdline = cmdline(cred.pid);
     EXPECT_NE(service_cmdline.find("zuvo-upload-svc"), std::string::npos);
     EXPECT_EQ(service_cmdline.find("secret"), std::string::npos) << service_cmdline;
+    // SIGTERM ends it even with this connection still open and silent.
     ASSERT_EQ(kill(cred.pid, SIGTERM), 0);
     EXPECT_TRUE(zv_test::wait_for([&] { return cmdline(cred.pid).empty(); }, 30000));
+    close(fd);
 }
 
 } // namespace
