@@ -1,6 +1,7 @@
 // The service's process entry: the launch extras read into the batch settings, the window
-// stack built at create and taken down at terminate, one pair of key handlers per launch.
-// The real program as a running instance is the end-to-end tests' (tests/e2e).
+// stack built at create and taken down at terminate, one pair of key handlers per launch, the
+// screen-reader notice. The real program as a running instance is the end-to-end tests'
+// (tests/e2e).
 #include <Ecore.h>
 #include <Ecore_Input.h>
 #include <Elementary.h>
