@@ -1,6 +1,7 @@
-// A small application on the host application framework for the framework's own tests: it
-// makes a window named like the service's and writes one line per lifecycle callback (with
-// the launch request's extras) to $ZV_PROBE_LOG. Extras that steer it:
+// A small application on the host application framework, for the tests of the framework and
+// of what sends it launch requests: it makes a window named like the service's and writes one
+// line per lifecycle callback (with the launch request's extras) to $ZV_PROBE_LOG. Extras
+// that steer it:
 //   PROBE_EXIT       ends the application (ui_app_exit)
 //   PROBE_ICONIFY    reports the window iconified, PROBE_RESTORE restored
 // $ZV_PROBE_FAIL_CREATE set makes create fail.

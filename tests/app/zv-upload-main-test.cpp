@@ -1,6 +1,7 @@
 // The service's process entry: the launch extras read into the batch settings, the window
-// stack built at create and taken down at terminate, one pair of key handlers per launch.
-// The real program as a running instance is the end-to-end tests' (tests/e2e).
+// stack built at create and taken down at terminate, one pair of key handlers per launch, the
+// screen-reader notice. The real program as a running instance is the end-to-end tests'
+// (tests/e2e).
 #include <Ecore.h>
 #include <Ecore_Input.h>
 #include <Elementary.h>
@@ -8,9 +9,13 @@
 #include <efl_extension.h>
 #include <gtest/gtest.h>
 #include <stdlib.h>
+#include <string.h>
+#include <vconf.h>
 
+#include <array>
 #include <sstream>
 #include <string>
+#include <vector>
 
 #include "zv-test-util.h"
 #include "zv-upload-view.h"
@@ -28,12 +33,18 @@ namespace
 // Every log line of this process goes to one file.
 LogFile process_log;
 
-app_control_h make_request(const std::vector<std::pair<const char *, const char *>> &extras)
+// A launch request with these values (null: absent) of token, category, description, tag,
+// access type and location.
+app_control_h make_request(const std::array<const char *, 6> &values)
 {
+    static const char *const keys[] = {"ZV_DATA_ACCESS_TOKEN", "ZV_DATA_CATEGORY",
+                                       "ZV_DATA_DESCRIPTION",  "ZV_DATA_TAG",
+                                       "ZV_DATA_ACCESS_TYPE",  "ZV_DATA_USE_LOCATION"};
     app_control_h h = nullptr;
     app_control_create(&h);
-    for (const auto &kv : extras)
-        app_control_add_extra_data(h, kv.first, kv.second);
+    for (size_t i = 0; i < values.size(); i++)
+        if (values[i])
+            app_control_add_extra_data(h, keys[i], values[i]);
     return h;
 }
 
@@ -47,42 +58,41 @@ std::string batch(const AppData &ad)
     return out.str();
 }
 
+// The popups of the window's canvas.
+std::vector<Evas_Object *> popups(Evas_Object *win)
+{
+    std::vector<Evas_Object *> found;
+    for (Evas_Object *o = evas_object_bottom_get(evas_object_evas_get(win)); o;
+         o = evas_object_above_get(o))
+        if (elm_object_widget_check(o) && !strcmp(elm_object_widget_type_get(o), "Elm_Popup"))
+            found.push_back(o);
+    return found;
+}
+
 } // namespace
 
-// All or nothing: a request that lacks a required extra logs why and keeps the batch.
-TEST(UploadMainExtras, ReadingRules)
+// All or nothing: a request that lacks a required extra logs why and keeps the batch. The
+// callbacks refuse what is null.
+TEST(UploadMainExtras, ReadingRulesAndNullArguments)
 {
-    const char *tok = "ZV_DATA_ACCESS_TOKEN", *cat = "ZV_DATA_CATEGORY",
-               *type = "ZV_DATA_ACCESS_TYPE";
     const char *missing = "app_control_get_extra_data error : -126";
     const struct {
-        std::vector<std::pair<const char *, const char *>> extras;
+        std::array<const char *, 6> extras;
         const char *failure; // logged when the request is refused
         const char *batch;
     } cases[] = {
-        // every extra
-        {{{tok, "tok"},
-          {cat, "Music"},
-          {"ZV_DATA_DESCRIPTION", "d"},
-          {"ZV_DATA_TAG", "a,b"},
-          {type, "2"}},
-         nullptr,
-         "tok Music d a,b 2 0"},
-        // the optional ones absent
-        {{{tok, "t2"}, {cat, "People"}, {type, "1"}}, nullptr, "t2 People - - 1 0"},
-        // an access type that is not a number
-        {{{tok, "t3"}, {cat, "Pets"}, {type, "x"}}, nullptr, "t3 Pets - - 0 0"},
+        {{"tok", "Music", "d", "a,b", "2"}, nullptr, "tok Music d a,b 2 0"},
+        {{"t2", "People", nullptr, nullptr, "1"}, nullptr, "t2 People - - 1 0"},
+        {{"t3", "Pets", nullptr, nullptr, "x"}, nullptr, "t3 Pets - - 0 0"}, // not a number
         // no access type, no token, no category: the batch stays
-        {{{tok, "t4"}, {cat, "Cars"}}, missing, "t3 Pets - - 0 0"},
-        {{{cat, "Cars"}, {type, "1"}}, "app_control_get_extra_data error: -126", "t3 Pets - - 0 0"},
-        {{{tok, "t5"}, {type, "1"}}, missing, "t3 Pets - - 0 0"},
+        {{"t4", "Cars"}, missing, "t3 Pets - - 0 0"},
+        {{nullptr, "Cars", nullptr, nullptr, "1"},
+         "app_control_get_extra_data error: -126",
+         "t3 Pets - - 0 0"},
+        {{"t5", nullptr, nullptr, nullptr, "1"}, missing, "t3 Pets - - 0 0"},
         // the location on, and "0" is off
-        {{{tok, "t6"}, {cat, "Pets"}, {type, "0"}, {"ZV_DATA_USE_LOCATION", "true"}},
-         nullptr,
-         "t6 Pets - - 0 1"},
-        {{{tok, "t7"}, {cat, "Pets"}, {type, "0"}, {"ZV_DATA_USE_LOCATION", "0"}},
-         nullptr,
-         "t7 Pets - - 0 0"},
+        {{"t6", "Pets", nullptr, nullptr, "0", "true"}, nullptr, "t6 Pets - - 0 1"},
+        {{"t7", "Pets", nullptr, nullptr, "0", "0"}, nullptr, "t7 Pets - - 0 0"},
     };
     AppData ad{};
     for (const auto &c : cases) {
@@ -95,11 +105,33 @@ TEST(UploadMainExtras, ReadingRules)
     }
     free(ad.access_token);
     free(ad.category);
+
+    ad = AppData{};
+    process_log.mark();
+    EXPECT_FALSE(_app_create(nullptr));
+    EXPECT_TRUE(process_log.logged("userp is NULL"));
+    _app_control(nullptr, &ad);
+    EXPECT_TRUE(process_log.logged("service handle is NULL"));
+    app_control_h h = make_request({});
+    _app_control(h, &ad);
+    app_control_destroy(h);
+    EXPECT_TRUE(process_log.logged("win is NULL"));
+    _zv_upload_win_rot_changed_cb(nullptr, nullptr, nullptr);
+    EXPECT_TRUE(process_log.logged("obj is NULL"));
+    _app_pause(&ad);
+    EXPECT_TRUE(ad.is_paused);
+    _app_resume(&ad);
+    EXPECT_FALSE(ad.is_paused);
 }
 
+// Create builds the window stack, terminate takes it down; missing colour and font tables
+// are logged and create goes on. The screen reader is off while the application runs; the
+// notice that says so shows once, and only when the host's screen reader (its settings key)
+// was on.
 TEST(UploadMainApp, CreateBuildsTheWindowStackAndTerminateTakesItDown)
 {
     TempDir tmp;
+    ASSERT_EQ(vconf_set_int("db/setting/accessibility/tts", 1), 0);
     AppData ad{};
     ASSERT_TRUE(_app_create(&ad));
     ASSERT_NE(ad.win, nullptr);
@@ -111,23 +143,26 @@ TEST(UploadMainApp, CreateBuildsTheWindowStackAndTerminateTakesItDown)
     EXPECT_NE(ad.color_table, nullptr);
     EXPECT_NE(ad.font_table, nullptr);
     EXPECT_NE(ad.exit, nullptr); // the controller started
-    // The naviframe carries the view's more callback.
-    EXPECT_EQ(
-        eext_object_event_callback_del(ad.navi, EEXT_CALLBACK_MORE, zv_upload_view_morekey_cb),
-        &ad);
+    // The naviframe carries the view's more callback, once.
+    for (void *data : {(void *)&ad, (void *)nullptr})
+        EXPECT_EQ(
+            eext_object_event_callback_del(ad.navi, EEXT_CALLBACK_MORE, zv_upload_view_morekey_cb),
+            data);
 
     // Two launch requests leave one pair of key handlers: a key event reaches the view once,
     // and with the current pair gone it reaches the view no more. The window, iconified
     // meanwhile, comes back with a launch request.
     elm_win_iconified_set(ad.win, EINA_TRUE);
     for (int i = 0; i < 2; i++) {
-        app_control_h h = make_request({{"ZV_DATA_ACCESS_TOKEN", "t"},
-                                        {"ZV_DATA_CATEGORY", "Music"},
-                                        {"ZV_DATA_ACCESS_TYPE", "1"}});
+        app_control_h h = make_request({"t", "Music", nullptr, nullptr, "1"});
         _app_control(h, &ad);
         app_control_destroy(h);
     }
     EXPECT_FALSE(elm_win_iconified_get(ad.win));
+    EXPECT_FALSE(elm_config_access_get());
+    ASSERT_EQ(popups(ad.win).size(), 1u);
+    EXPECT_STREQ(elm_object_text_get(popups(ad.win)[0]),
+                 "The screen reader has been turned off while you use ZuVo uploads.");
     ASSERT_NE(ad.key_down_handler, nullptr);
     auto press = [] {
         auto *ev = static_cast<Ecore_Event_Key *>(calloc(1, sizeof(Ecore_Event_Key)));
@@ -151,37 +186,16 @@ TEST(UploadMainApp, CreateBuildsTheWindowStackAndTerminateTakesItDown)
     EXPECT_EQ(ad.key_up_handler, nullptr);
     free(ad.access_token);
     free(ad.category);
-}
 
-// Missing colour and font tables are logged and create goes on; callbacks refuse what is null.
-TEST(UploadMainApp, MissingTablesAndNullArguments)
-{
-    TempDir tmp;
-    std::string saved = getenv("ZV_RES_DIR") ? getenv("ZV_RES_DIR") : "";
+    const std::string saved = getenv("ZV_RES_DIR") ? getenv("ZV_RES_DIR") : ZV_BUILD_RES_DIR;
     setenv("ZV_RES_DIR", tmp.path().c_str(), 1);
-    AppData ad{};
+    ad = AppData{};
     process_log.mark();
     EXPECT_TRUE(_app_create(&ad));
-    saved.empty() ? unsetenv("ZV_RES_DIR") : setenv("ZV_RES_DIR", saved.c_str(), 1);
+    setenv("ZV_RES_DIR", saved.c_str(), 1);
     EXPECT_TRUE(process_log.logged("[ERR] color table create fail"));
     EXPECT_TRUE(process_log.logged("[ERR] font table create fail"));
     EXPECT_EQ(ad.color_table, nullptr);
+    EXPECT_TRUE(popups(ad.win).empty());
     _app_terminate(&ad);
-
-    ad = AppData{};
-    process_log.mark();
-    EXPECT_FALSE(_app_create(nullptr));
-    EXPECT_TRUE(process_log.logged("userp is NULL"));
-    _app_control(nullptr, &ad);
-    EXPECT_TRUE(process_log.logged("service handle is NULL"));
-    app_control_h h = make_request({});
-    _app_control(h, &ad);
-    app_control_destroy(h);
-    EXPECT_TRUE(process_log.logged("win is NULL"));
-    _zv_upload_win_rot_changed_cb(nullptr, nullptr, nullptr);
-    EXPECT_TRUE(process_log.logged("obj is NULL"));
-    _app_pause(&ad);
-    EXPECT_TRUE(ad.is_paused);
-    _app_resume(&ad);
-    EXPECT_FALSE(ad.is_paused);
 }

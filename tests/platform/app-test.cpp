@@ -5,7 +5,6 @@
 #include <fcntl.h>
 #include <glib.h>
 #include <gtest/gtest.h>
-#include <signal.h>
 #include <stdlib.h>
 #include <string.h>
 #include <sys/file.h>
@@ -26,31 +25,7 @@ using namespace zv_test;
 namespace
 {
 
-using Extras = std::vector<std::pair<std::string, std::string>>;
 using Lines = std::vector<std::string>;
-
-app_control_h make_request(const Extras &extras)
-{
-    app_control_h h = nullptr;
-    app_control_create(&h);
-    for (const auto &kv : extras)
-        app_control_add_extra_data(h, kv.first.c_str(), kv.second.c_str());
-    return h;
-}
-
-Extras extras_of(app_control_h h)
-{
-    Extras out;
-    auto collect = [](app_control_h h, const char *key, void *out) {
-        char *value = nullptr;
-        app_control_get_extra_data(h, key, &value);
-        static_cast<Extras *>(out)->emplace_back(key, value ? value : "");
-        free(value);
-        return true;
-    };
-    app_control_foreach_extra_data(h, collect, &out);
-    return out;
-}
 
 std::string u32(uint32_t v)
 {
@@ -81,24 +56,17 @@ long count_of(const std::string &path, const std::string &line)
 } // namespace
 
 // The codec's round trip runs across processes in the instance test and the companion's
-// launch test; here, what it must refuse.
+// launch test; here, what it must refuse. A missing key answers no value.
 TEST(LaunchMessage, BadMessagesAreRefused)
 {
-    auto message = [](const Extras &extras) {
-        app_control_h h = make_request(extras);
-        size_t size = 0;
-        unsigned char *data = zv_app_launch_message_encode(h, &size);
-        std::string out(reinterpret_cast<char *>(data), size);
-        g_free(data);
-        app_control_destroy(h);
-        return out;
-    };
-    auto parse = [](const std::string &bytes, app_control_h *out) {
-        return zv_app_launch_message_parse(reinterpret_cast<const unsigned char *>(bytes.data()),
-                                           bytes.size(), out);
-    };
-    const std::string one = message({{"k", "v"}});
+    app_control_h h = nullptr;
+    app_control_create(&h);
+    app_control_add_extra_data(h, "k", "v");
+    size_t size = 0;
+    unsigned char *data = zv_app_launch_message_encode(h, &size);
+    const std::string one(reinterpret_cast<char *>(data), size);
     const std::string payload_one = one.substr(ZV_APP_LAUNCH_HEADER_SIZE);
+    g_free(data);
     auto framed = [](const std::string &payload) { return "ZVL1" + u32(payload.size()) + payload; };
     const std::string cases[] = {
         "",                                                       // empty
@@ -116,22 +84,17 @@ TEST(LaunchMessage, BadMessagesAreRefused)
     for (const auto &bytes : cases) {
         SCOPED_TRACE(&bytes - cases);
         app_control_h parsed = reinterpret_cast<app_control_h>(1);
-        EXPECT_EQ(parse(bytes, &parsed), APP_CONTROL_ERROR_INVALID_DATA_TYPE);
+        EXPECT_EQ(zv_app_launch_message_parse(reinterpret_cast<const unsigned char *>(bytes.data()),
+                                              bytes.size(), &parsed),
+                  APP_CONTROL_ERROR_INVALID_DATA_TYPE);
         EXPECT_EQ(parsed, nullptr);
     }
 
-    app_control_h h = make_request({{"big", std::string(ZV_APP_LAUNCH_MAX_MESSAGE, 'x')}});
-    size_t size = 0;
+    app_control_add_extra_data(h, "big", std::string(ZV_APP_LAUNCH_MAX_MESSAGE, 'x').c_str());
     EXPECT_EQ(zv_app_launch_message_encode(h, &size), nullptr);
-    app_control_destroy(h);
-
-    // A present key is replaced in place; a missing one answers no value.
-    h = make_request({{"a", "1"}, {"b", "2"}});
     char *value = reinterpret_cast<char *>(1);
     EXPECT_EQ(app_control_get_extra_data(h, "missing", &value), APP_CONTROL_ERROR_KEY_NOT_FOUND);
     EXPECT_EQ(value, nullptr);
-    app_control_add_extra_data(h, "a", "one");
-    EXPECT_EQ(extras_of(h), (Extras{{"a", "one"}, {"b", "2"}}));
     app_control_destroy(h);
 }
 
@@ -140,8 +103,7 @@ TEST(AppPaths, ResourcePathAndRuntimeDir)
     const std::string saved = getenv("ZV_RES_DIR") ? getenv("ZV_RES_DIR") : "";
     char *cwd = g_get_current_dir();
     const std::pair<const char *, std::string> cases[] = {
-        {"/opt/zuvo/res", "/opt/zuvo/res/"},
-        {"/opt/zuvo/res/", "/opt/zuvo/res/"},
+        {"/opt/zuvo/res", "/opt/zuvo/res/"}, // (with its slash: the tests' own setting)
         {"rel/res", std::string(cwd) + "/rel/res/"},
         {nullptr, ZV_BUILD_RES_DIR}, // tests run from the build tree's bin folder
     };
@@ -184,31 +146,37 @@ class AppInstanceTest : public ::testing::Test
     std::string socket_ = tmp_.file("run/zuvo-upload-svc.sock");
 };
 
-// Wrong command lines answer one line and status 2, before any instance is looked for.
-TEST_F(AppInstanceTest, WrongCommandLinesAnswerOneLineAndStatus2)
+// Wrong command lines answer one line and status 2, before any instance is looked for; a
+// failed create ends the application before any launch request, with a failure status.
+TEST_F(AppInstanceTest, WrongCallsAndFailedCreate)
 {
     for (std::string args : {"--extra", "--extra novalue", "--extra =value", "--bogus", "extra"}) {
-        std::string out;
-        EXPECT_EQ(run_program({"/bin/sh", "-c", bin_path("zv-app-probe") + " " + args + " 2>&1"},
-                              "", &out),
-                  2)
-            << args;
+        std::string out, cmd = bin_path("zv-app-probe") + " " + args + " 2>&1";
+        EXPECT_EQ(run_program({"/bin/sh", "-c", cmd}, "", &out), 2) << args;
         EXPECT_EQ(std::count(out.begin(), out.end(), '\n'), 1) << out;
     }
     std::string out;
-    EXPECT_EQ(run_program({bin_path("zv-app-probe"), "--help"}, "", &out), 0);
+    EXPECT_EQ(run_program(probe({"--help"}), "", &out), 0);
     EXPECT_NE(out.find("--extra KEY=VALUE"), std::string::npos);
+
+    Child child;
+    ASSERT_TRUE(child.start(probe({"--extra", "A=1"}), "", {{"ZV_PROBE_FAIL_CREATE", "1"}}));
+    EXPECT_EQ(exit_status(child), 1);
+    EXPECT_EQ(lines_of(log_),
+              (Lines{"create", "exit " + std::to_string(APP_ERROR_INVALID_CONTEXT)}));
 }
 
 // The instance makes its open runtime folder private and takes later launches (a stale
 // socket and a later launch of the service itself: the e2e tests' restarts); a malformed
 // message is refused; iconified is pause, restored is resume, a launch in the foreground
-// changes nothing; SIGTERM ends it in order, leaving neither socket nor lock.
-TEST_F(AppInstanceTest, LaterLaunchesReachTheInstanceWhichEndsOnSigterm)
+// changes nothing; a request to exit ends it in order, leaving neither socket nor lock. A key
+// given twice keeps its place with the later value. (SIGTERM ending the service in order: the
+// e2e tests, whose every service ends that way.)
+TEST_F(AppInstanceTest, LaterLaunchesReachTheInstanceWhichEndsInOrder)
 {
     mkdir(tmp_.file("run").c_str(), 0755);
     Child instance;
-    ASSERT_TRUE(instance.start(probe({"--extra", "A=", "--extra=B=x=y"})));
+    ASSERT_TRUE(instance.start(probe({"--extra", "A=1", "--extra=B=x=y", "--extra", "A="})));
     ASSERT_TRUE(wait_for([&] { return count_of(log_, "resume") > 0; }, 20000));
     EXPECT_EQ(lines_of(log_), (Lines{"create", "app_control A= B=x=y", "resume"}));
     EXPECT_EQ(mode_of(socket_), 0600);
@@ -231,7 +199,8 @@ TEST_F(AppInstanceTest, LaterLaunchesReachTheInstanceWhichEndsOnSigterm)
     EXPECT_EQ(read(fd, &reply, 1), 1);
     EXPECT_EQ(reply, 'R');
     close(fd);
-    app_control_h h = make_request({{"D", "4"}});
+    app_control_h h = nullptr;
+    app_control_create(&h);
     app_control_set_app_id(h, "other-app");
     EXPECT_EQ(app_control_send_launch_request(h, nullptr, nullptr),
               APP_CONTROL_ERROR_APP_NOT_FOUND);
@@ -244,15 +213,16 @@ TEST_F(AppInstanceTest, LaterLaunchesReachTheInstanceWhichEndsOnSigterm)
     EXPECT_EQ(launch({"--extra", "PROBE_RESTORE=2"}), 0);
     ASSERT_TRUE(wait_for([&] { return count_of(log_, "app_control PROBE_RESTORE=2") == 1; }));
 
-    instance.signal(SIGTERM);
+    EXPECT_EQ(launch({"--extra", "PROBE_EXIT=1"}), 0);
     EXPECT_EQ(exit_status(instance), 0) << read_file(log_);
     Lines lines = lines_of(log_); // without the launchers' own exit lines
     lines.erase(std::remove(lines.begin(), lines.end(),
                             "exit " + std::to_string(APP_ERROR_ALREADY_RUNNING)),
                 lines.end());
-    ASSERT_GE(lines.size(), 3u);
-    EXPECT_EQ(Lines(lines.end() - 3, lines.end()),
-              (Lines{"app_control PROBE_RESTORE=2", "terminate", "exit 0"}));
+    ASSERT_GE(lines.size(), 4u);
+    EXPECT_EQ(
+        Lines(lines.end() - 4, lines.end()),
+        (Lines{"app_control PROBE_RESTORE=2", "app_control PROBE_EXIT=1", "terminate", "exit 0"}));
     EXPECT_EQ(count_of(log_, "pause"), 1);
     EXPECT_EQ(count_of(log_, "resume"), 2);
     EXPECT_NE(access(socket_.c_str(), F_OK), 0);
@@ -260,26 +230,4 @@ TEST_F(AppInstanceTest, LaterLaunchesReachTheInstanceWhichEndsOnSigterm)
     ASSERT_GE(lock, 0);
     EXPECT_EQ(flock(lock, LOCK_EX | LOCK_NB), 0);
     close(lock);
-}
-
-// A request asking to exit ends the application in order; a failed create ends it before any
-// launch request, with a failure status.
-TEST_F(AppInstanceTest, RequestToExitAndFailedCreate)
-{
-    const struct {
-        bool fail_create;
-        int status;
-        Lines lines;
-    } cases[] = {
-        {false, 0, {"create", "app_control PROBE_EXIT=1", "resume", "terminate", "exit 0"}},
-        {true, 1, {"create", "exit " + std::to_string(APP_ERROR_INVALID_CONTEXT)}},
-    };
-    for (const auto &c : cases) {
-        unlink(log_.c_str());
-        Child child;
-        ASSERT_TRUE(child.start(probe({"--extra", "PROBE_EXIT=1"}), "",
-                                c.fail_create ? Env{{"ZV_PROBE_FAIL_CREATE", "1"}} : Env{}));
-        EXPECT_EQ(exit_status(child), c.status);
-        EXPECT_EQ(lines_of(log_), c.lines);
-    }
 }

@@ -70,10 +70,8 @@ TEST(Vconf, KeyFilesReadingRulesWatchAndTool)
         ASSERT_TRUE(write_file(tmp.file("run/vconf/db/nl"), c[0]));
         EXPECT_EQ(read_key("db/nl"), c[1]) << c[0];
     }
-    for (const char *bad : {"", "/abs", "a/../b", "a//b", ".hidden", "a/.b"}) {
+    for (const char *bad : {"", "/abs", "a/../b", "a//b", ".hidden", "a/.b"})
         EXPECT_EQ(vconf_set_int(bad, 1), VCONF_ERROR) << bad;
-        EXPECT_EQ(zv_vconf_key_valid(bad), 0) << bad;
-    }
 
     // A plain rewrite in place is seen by a watch, and a string node answers no int; a
     // watch is ignored once. (Changes by this process and by the tool reaching the watches
