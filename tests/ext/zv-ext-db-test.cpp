@@ -9,7 +9,6 @@
 #include <unistd.h>
 
 #include <chrono>
-#include <string>
 #include <thread>
 
 #include "zv-test-util.h"
@@ -19,28 +18,21 @@ namespace
 
 zv_test::LogFile g_log;
 
-char *str(const char *s)
-{
-    return const_cast<char *>(s);
-}
-
 // The rows of a load, one a line: historyid title filename filesize url percent status
 // userid date, "-" for NULL.
 std::string load(bool ready_only = false)
 {
     GList *list = nullptr;
-    EXPECT_EQ(ready_only ? zv_ext_db_load_ready_item_list(&list)
-                         : zv_ext_db_load_full_item_list(&list),
+    EXPECT_EQ((ready_only ? zv_ext_db_load_ready_item_list : zv_ext_db_load_full_item_list)(&list),
               1);
     auto text = [](const char *s) { return s ? s : "-"; };
     std::string out;
     for (GList *l = list; l; l = l->next) {
         auto *r = static_cast<DbItem *>(l->data);
-        gchar *line = g_strdup_printf(
+        g_autofree gchar *line = g_strdup_printf(
             "%d %s %s %lld %s %d %d %s %g\n", r->historyid, text(r->title), text(r->filename),
             (long long)r->filesize, text(r->url), r->percent, r->status, text(r->userid), r->date);
         out += line;
-        g_free(line);
     }
     zv_ext_db_free_item_list(list);
     return out;
@@ -50,95 +42,75 @@ std::string load(bool ready_only = false)
 void insert(int id, int status, double date, const char *title = "t", const char *url = nullptr,
             const char *userid = nullptr)
 {
-    DbItem item{id,       str(userid), str(title), str("/v/a.mp4"), 5000000000LL, 7,
-                str(url), status,      date};
+    DbItem item{id,          (char *)userid, (char *)title, (char *)"/v/a.mp4", 5000000000LL, 7,
+                (char *)url, status,         date};
     ASSERT_EQ(zv_ext_db_insert_item(&item), 1);
 }
 
 // Only percent, status and url are to be written.
 int update(int id, int percent, int status, const char *url = nullptr)
 {
-    DbItem item{id, str("u"), str("changed"), str("/changed"), 1, percent, str(url), status, 99};
+    DbItem item{id,     (char *)"u", (char *)"changed", (char *)"/changed", 1, percent, (char *)url,
+                status, 99};
     return zv_ext_db_update_item(&item);
 }
 
 class HistoryStoreTest : public ::testing::Test
 {
   protected:
-    void SetUp() override { g_log.mark(); }
     void TearDown() override { zv_ext_db_close(); }
 
     zv_test::TempDir tmp_;
     const std::string db_ = tmp_.file("db/.zuvo-history.db");
 };
 
-// A lock of the other process past the busy handler's waits makes statements fail (an
-// update says so, to be stored again); a shorter one is waited for.
-TEST_F(HistoryStoreTest, LockOfTheOtherProcess)
+// A file that is not a database is left as it is and every operation fails; once it is gone,
+// open makes the folder and the file. Rows load in date order with their NULLs and are
+// counted by status; update writes only percent, status and url; delete takes every row of
+// the id; the rows outlive the connection. A lock of the other process past the busy
+// handler's waits makes statements fail (an update says so, to be stored again); a shorter
+// one is waited for.
+TEST_F(HistoryStoreTest, RowsRoundTripBesideTheOtherProcess)
 {
+    const std::string junk(4096, 'x');
+    ASSERT_TRUE(mkdir(tmp_.file("db").c_str(), 0700) == 0 && zv_test::write_file(db_, junk));
+    EXPECT_EQ(zv_ext_db_open(), 0);
+    EXPECT_TRUE(g_log.logged("file is not a database"));
+    DbItem item{};
+    GList *list = nullptr;
+    EXPECT_EQ(zv_ext_db_insert_item(&item) + zv_ext_db_delete_item(1) +
+                  zv_ext_db_load_ready_item_list(&list),
+              0);
+    EXPECT_EQ(zv_ext_db_get_active_count(), -1);
+    EXPECT_EQ(zv_test::read_file(db_), junk);
+    ASSERT_TRUE(unlink(db_.c_str()) == 0 && rmdir(tmp_.file("db").c_str()) == 0);
     ASSERT_EQ(zv_ext_db_open(), 1);
-    insert(5, ZV_UPLOAD_STATUS_WAITING, 1);
+    EXPECT_EQ(zv_ext_db_open(), 1);
+    EXPECT_EQ(load(), "");
+    EXPECT_EQ(zv_ext_db_insert_item(nullptr), 0);
+    insert(3, ZV_UPLOAD_STATUS_READY, 30.5, "third", "http://u/3", "me");
+    insert(1, ZV_UPLOAD_STATUS_COMPLETED, 10.25, nullptr);
+    insert(2, ZV_UPLOAD_STATUS_WAITING, 20, "second", nullptr, "me");
+
     sqlite3 *other = nullptr;
     ASSERT_EQ(sqlite3_open(db_.c_str(), &other), SQLITE_OK);
     ASSERT_EQ(sqlite3_exec(other, "BEGIN IMMEDIATE", nullptr, nullptr, nullptr), SQLITE_OK);
-    EXPECT_EQ(zv_ext_db_delete_item(5), 0);
-    EXPECT_EQ(update(5, 40, ZV_UPLOAD_STATUS_UPLOADING), 0);
+    EXPECT_EQ(zv_ext_db_delete_item(3), 0);
+    EXPECT_EQ(update(2, 55, ZV_UPLOAD_STATUS_READY, "http://upload/2"), 0);
     // The store's lines stay whole; the library's message follows on a line of its own.
     for (const char *line : {"SQL error: 5", "SQL return: 5", "sqlite: database is locked"})
         EXPECT_TRUE(g_log.logged(std::string(line) + ZV_LOG_RESET "\n")) << line;
-
     g_log.mark();
     std::thread release([other] {
         for (int i = 0; i < 6000 && !g_log.logged("busy handler called (count : 0)"); i++)
             std::this_thread::sleep_for(std::chrono::milliseconds(5));
         sqlite3_exec(other, "COMMIT", nullptr, nullptr, nullptr);
     });
-    EXPECT_EQ(update(5, 40, ZV_UPLOAD_STATUS_UPLOADING), 1);
+    EXPECT_EQ(update(2, 55, ZV_UPLOAD_STATUS_READY, "http://upload/2"), 1);
     release.join();
     sqlite3_close(other);
     EXPECT_FALSE(g_log.logged("SQLITE_BUSY"));
-    EXPECT_EQ(load(), "5 t /v/a.mp4 5000000000 - 40 3 - 1\n");
-}
 
-// Past 5000 rows an insert first deletes every completed row.
-TEST_F(HistoryStoreTest, InsertTrimsCompletedRowsPast5000)
-{
-    const struct {
-        int rows;
-        const char *completed; // which rows are completed, as a condition on their number i
-        int expected_after;
-    } cases[] = {
-        {5000, "i % 2 = 0", 5001}, {5001, "i % 2 = 0", 5001 - 2501 + 1}, {5001, "0", 5002}};
-    for (const auto &c : cases) {
-        SCOPED_TRACE(c.rows);
-        zv_test::TempDir dir;
-        ASSERT_EQ(zv_ext_db_open(), 1);
-        const std::string fill =
-            "insert into history (historyid, status, date) with recursive n(i) as (select 0 "
-            "union all select i + 1 from n where i + 1 < " +
-            std::to_string(c.rows) + ") select 1000 + i, case when " + c.completed +
-            " then 4 else 0 end, i from n";
-        sqlite3 *raw = nullptr;
-        ASSERT_EQ(sqlite3_open(dir.file("db/.zuvo-history.db").c_str(), &raw), SQLITE_OK);
-        EXPECT_EQ(sqlite3_exec(raw, fill.c_str(), nullptr, nullptr, nullptr), SQLITE_OK);
-        sqlite3_close(raw);
-        insert(1, ZV_UPLOAD_STATUS_READY, 1e9, "new");
-        EXPECT_EQ(zv_ext_db_get_full_count(), c.expected_after);
-        zv_ext_db_close();
-    }
-}
-
-// Rows load in date order with their NULLs and are counted by status; update writes only
-// percent, status and url; delete takes every row of the id.
-TEST_F(HistoryStoreTest, RowsRoundTrip)
-{
-    ASSERT_EQ(zv_ext_db_open(), 1);
-    EXPECT_EQ(load(), "");
-    EXPECT_EQ(zv_ext_db_insert_item(nullptr), 0);
-    insert(3, ZV_UPLOAD_STATUS_READY, 30.5, "third", "http://u/3", "me");
-    insert(1, ZV_UPLOAD_STATUS_COMPLETED, 10.25, nullptr);
-    insert(2, ZV_UPLOAD_STATUS_WAITING, 20, "second", nullptr, "me");
-    ASSERT_EQ(update(2, 55, ZV_UPLOAD_STATUS_READY, "http://upload/2"), 1);
     const std::string one = "1 - /v/a.mp4 5000000000 - 7 4 - 10.25\n",
                       three = "3 third /v/a.mp4 5000000000 http://u/3 7 0 me 30.5\n";
     EXPECT_EQ(load(), one + "2 second /v/a.mp4 5000000000 http://upload/2 55 0 me 20\n" + three);
@@ -156,34 +128,27 @@ TEST_F(HistoryStoreTest, RowsRoundTrip)
     EXPECT_EQ(zv_ext_db_get_active_count(), 2 + 3 + 4 + 5);
     EXPECT_EQ(zv_ext_db_get_uploading_count(), 3 + 5);
     EXPECT_EQ(zv_ext_db_get_completed_count(), 7);
-    EXPECT_EQ(zv_ext_db_get_full_count(), 21);
-}
-
-// A file that is not a database is left as it is and every operation fails; once it is
-// gone, open makes the folder and the file, whose rows outlive the connection.
-TEST_F(HistoryStoreTest, OpenLeavesAForeignFileAloneAndMakesFolderAndFile)
-{
-    ASSERT_EQ(mkdir(tmp_.file("db").c_str(), 0700), 0);
-    ASSERT_TRUE(zv_test::write_file(db_, std::string(4096, 'x')));
-    EXPECT_EQ(zv_ext_db_open(), 0);
-    EXPECT_TRUE(g_log.logged("file is not a database"));
-    DbItem item{};
-    GList *list = nullptr;
-    EXPECT_EQ(zv_ext_db_insert_item(&item) + zv_ext_db_delete_item(1) +
-                  zv_ext_db_load_ready_item_list(&list),
-              0);
-    EXPECT_EQ(zv_ext_db_get_active_count(), -1);
-    EXPECT_EQ(zv_test::read_file(db_), std::string(4096, 'x'));
-
-    ASSERT_EQ(unlink(db_.c_str()), 0);
-    ASSERT_EQ(rmdir(tmp_.file("db").c_str()), 0);
-    ASSERT_EQ(zv_ext_db_open(), 1);
-    EXPECT_EQ(zv_ext_db_open(), 1);
-    EXPECT_EQ(zv_ext_db_insert_item(&item), 1);
     zv_ext_db_close();
     EXPECT_EQ(zv_ext_db_get_full_count(), -1);
     ASSERT_EQ(zv_ext_db_open(), 1);
-    EXPECT_EQ(zv_ext_db_get_full_count(), 1);
+    EXPECT_EQ(zv_ext_db_get_full_count(), 21);
+}
+
+// Past 5000 rows an insert first deletes every completed row: at 5000 rows nothing goes, past
+// them the completed rows go, and with none of them completed the table grows on.
+TEST_F(HistoryStoreTest, InsertTrimsCompletedRowsPast5000)
+{
+    ASSERT_EQ(zv_ext_db_open(), 1);
+    for (int i = 0; i < 5000; i++)
+        insert(1000 + i, i % 2 ? ZV_UPLOAD_STATUS_READY : ZV_UPLOAD_STATUS_COMPLETED, i);
+    for (int rows : {5001, 5001 - 2500 + 1}) {
+        insert(1, ZV_UPLOAD_STATUS_READY, 1e9, "new");
+        EXPECT_EQ(zv_ext_db_get_full_count(), rows);
+    }
+    for (int i = 0; i < 2499; i++)
+        insert(1000 + i, ZV_UPLOAD_STATUS_READY, i);
+    insert(1, ZV_UPLOAD_STATUS_READY, 1e9, "new");
+    EXPECT_EQ(zv_ext_db_get_full_count(), 5002);
 }
 
 } // namespace
