@@ -45,6 +45,24 @@ std::vector<std::string> json_objects(const std::string &array)
     return list;
 }
 
+// A member of a flat JSON object: a string unescaped, anything else as written; "" when absent.
+std::string json_get(const std::string &object, const std::string &key)
+{
+    size_t pos = object.find("\"" + key + "\":");
+    if (pos == std::string::npos)
+        return "";
+    pos += key.size() + 3;
+    if (object[pos] == '"')
+        return json_string(object, pos);
+    return object.substr(pos, object.find_first_of(",}]", pos) - pos);
+}
+
+long long json_number(const std::string &object, const std::string &key)
+{
+    std::string text = json_get(object, key);
+    return text.empty() ? -1 : atoll(text.c_str());
+}
+
 } // namespace
 
 Reply http(const std::string &method, const std::string &url,
@@ -85,21 +103,9 @@ std::string Reply::header(const std::string &name) const
     return headers.substr(at, headers.find("\r\n", at) - at);
 }
 
-std::string json_get(const std::string &object, const std::string &key)
+std::string Logged::get(const std::string &key) const
 {
-    size_t pos = object.find("\"" + key + "\":");
-    if (pos == std::string::npos)
-        return "";
-    pos += key.size() + 3;
-    if (object[pos] == '"')
-        return json_string(object, pos);
-    return object.substr(pos, object.find_first_of(",}]", pos) - pos);
-}
-
-long long json_number(const std::string &object, const std::string &key)
-{
-    std::string text = json_get(object, key);
-    return text.empty() ? -1 : atoll(text.c_str());
+    return json_get(line, key);
 }
 
 Logged::Logged(const std::string &l)

@@ -26,10 +26,6 @@ struct Reply {
 Reply http(const std::string &method, const std::string &url,
            const std::vector<std::string> &headers = {}, const std::string &body = "");
 
-// A member of a flat JSON object: a string unescaped, anything else as written; "" when absent.
-std::string json_get(const std::string &object, const std::string &key);
-long long json_number(const std::string &object, const std::string &key); // -1 when absent
-
 // One line of the server's request log.
 struct Logged {
     explicit Logged(const std::string &line);
@@ -38,7 +34,7 @@ struct Logged {
     std::string kind, upload_id;
     long long seq, status, body_length;
 
-    std::string get(const std::string &key) const { return json_get(line, key); }
+    std::string get(const std::string &key) const; // a member of the line, "" when absent
     std::string body() const; // decoded from body_base64
     std::optional<std::string> header(const std::string &name) const;
     // The first byte of the Content-Range, -1 for none or "bytes */*".

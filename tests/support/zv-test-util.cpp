@@ -9,6 +9,7 @@
 #include <fcntl.h>
 #include <signal.h>
 #include <stdlib.h>
+#include <string.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
@@ -39,8 +40,43 @@ std::map<pid_t, int> &reaped_by_loop()
     return statuses;
 }
 
-} // namespace
+// Forks argv (argv[0] a path) with this process's environment and env over it, its standard
+// input, output and error on fds (-1: inherited) and nofile, when above 0, as its open-file
+// limit; the pid, or -1. Everything the child uses is made before the fork: a child of a
+// process with other threads must not allocate before exec, since another thread may have held
+// the allocator's lock at the fork.
+pid_t launch(const std::vector<std::string> &argv, const Env &env, const int (&fds)[3],
+             rlim_t nofile = 0)
+{
+    std::vector<std::string> vars;
+    for (char **e = environ; *e; ++e) {
+        const std::string name(*e, strcspn(*e, "="));
+        if (std::none_of(env.begin(), env.end(), [&](const auto &kv) { return kv.first == name; }))
+            vars.push_back(*e);
+    }
+    for (const auto &kv : env)
+        vars.push_back(kv.first + "=" + kv.second);
+    std::vector<char *> args, envp;
+    for (const auto &a : argv)
+        args.push_back(const_cast<char *>(a.c_str()));
+    for (auto &v : vars)
+        envp.push_back(v.data());
+    args.push_back(nullptr);
+    envp.push_back(nullptr);
+    const rlimit limit = {nofile, nofile};
+    pid_t pid = fork();
+    if (pid == 0) {
+        for (int i = 0; i < 3; i++)
+            if (fds[i] >= 0)
+                dup2(fds[i], i);
+        if (nofile == 0 || setrlimit(RLIMIT_NOFILE, &limit) == 0)
+            execve(args[0], args.data(), envp.data());
+        _exit(127);
+    }
+    return pid;
+}
 
+// The wait status of a child that the main loop reaped; false when the loop has not reaped it.
 bool reaped_status(pid_t pid, int *status)
 {
     auto it = reaped_by_loop().find(pid);
@@ -50,29 +86,7 @@ bool reaped_status(pid_t pid, int *status)
     return true;
 }
 
-Exec::Exec(const std::vector<std::string> &argv, const Env &env)
-{
-    for (char **e = environ; *e; ++e) {
-        const std::string entry = *e;
-        const std::string name = entry.substr(0, entry.find('='));
-        if (std::none_of(env.begin(), env.end(), [&](const auto &kv) { return kv.first == name; }))
-            env_.push_back(entry);
-    }
-    for (const auto &kv : env)
-        env_.push_back(kv.first + "=" + kv.second);
-    for (const auto &a : argv)
-        argv_.push_back(const_cast<char *>(a.c_str()));
-    argv_.push_back(nullptr);
-    for (auto &e : env_)
-        envp_.push_back(e.data());
-    envp_.push_back(nullptr);
-}
-
-void Exec::run() const
-{
-    execve(argv_[0], argv_.data(), envp_.data());
-    _exit(127);
-}
+} // namespace
 
 TempDir::TempDir(bool set_env)
 {
@@ -150,15 +164,7 @@ pid_t spawn_piped(const std::vector<std::string> &argv, int *input, int *output)
     int in[2] = {-1, -1}, out[2] = {-1, -1};
     if ((input && pipe2(in, O_CLOEXEC) != 0) || (output && pipe2(out, O_CLOEXEC) != 0))
         return -1;
-    const Exec exec(argv);
-    pid_t pid = fork();
-    if (pid == 0) {
-        if (input)
-            dup2(in[0], 0);
-        if (output)
-            dup2(out[1], 1);
-        exec.run();
-    }
+    pid_t pid = launch(argv, {}, {in[0], out[1], -1});
     close(in[0]);
     close(out[1]);
     if (input)
@@ -202,26 +208,15 @@ bool Child::start(const std::vector<std::string> &argv, const std::string &out_p
 {
     reaped_by_loop();
     killed_ = false;
-    const Exec exec(argv, env);
-    const rlimit limit = {nofile, nofile};
-    pid_ = fork();
-    if (pid_ < 0)
-        return false;
-    if (pid_ == 0) {
-        int in = open("/dev/null", O_RDONLY);
-        dup2(in, 0);
-        int out =
-            out_path.empty() ? -1 : open(out_path.c_str(), O_WRONLY | O_CREAT | O_APPEND, 0600);
-        if (out >= 0) {
-            dup2(out, 1);
-            dup2(out, 2);
-        }
-        if (nofile > 0 && setrlimit(RLIMIT_NOFILE, &limit) != 0)
-            _exit(126);
-        exec.run();
-    }
-    exited_ = false;
-    return true;
+    int in = open("/dev/null", O_RDONLY | O_CLOEXEC),
+        out = out_path.empty() ? -1
+                               : open(out_path.c_str(), O_WRONLY | O_CREAT | O_APPEND | O_CLOEXEC, 0600);
+    pid_ = launch(argv, env, {in, out, out}, nofile);
+    close(in);
+    if (out >= 0)
+        close(out);
+    exited_ = pid_ < 0;
+    return pid_ > 0;
 }
 
 bool Child::running()

@@ -36,30 +36,12 @@ private:
 bool wait_for(const std::function<bool()> &pred, int timeout_ms = 5000,
               bool *quit_by_other = nullptr);
 
-// The wait status of a child that the main loop reaped (it reaps every child of the process
-// while it runs); false when the loop has not reaped it.
-bool reaped_status(pid_t pid, int *status);
-
 // Path of a program built into the build tree's bin folder.
 std::string bin_path(const std::string &program);
 // Path below the source tree.
 std::string source_path(const std::string &rel);
 
 using Env = std::vector<std::pair<std::string, std::string>>;
-
-// What a forked child executes: argv (argv[0] a path) with this process's environment and env
-// over it. The arrays are made before the fork: a child of a process with other threads must
-// not allocate before exec, since another thread may have held the allocator's lock at the fork.
-class Exec {
-public:
-    explicit Exec(const std::vector<std::string> &argv, const Env &env = {});
-    // In the forked child: executes, or exits 127.
-    [[noreturn]] void run() const;
-
-private:
-    std::vector<std::string> env_;
-    std::vector<char *> argv_, envp_;
-};
 
 // Starts argv (argv[0] a path) with its standard input (*input: the write end) and output
 // (*output: the read end) on pipes, or inherited where null; the pid, or -1.
