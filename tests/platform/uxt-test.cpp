@@ -46,7 +46,7 @@ int luma(uxt_theme_color_table_h table, const std::string &code)
 
 } // namespace
 
-TEST(UxtTables, ApplicationTablesReachEdjeAndObjects)
+TEST(UxtTables, ApplicationAndDarkTablesReachEdjeObjectsAndThemes)
 {
     uxt_theme_set_changeable_ui_enabled(true);
     uxt_theme_color_table_h colors = uxt_theme_add_color_table(kColors.c_str());
@@ -73,6 +73,20 @@ TEST(UxtTables, ApplicationTablesReachEdjeAndObjects)
     EXPECT_EQ(uxt_theme_object_set_color(image, "ZZ999"), UXT_ERROR_NO_DATA);
     evas_object_del(win);
 
+    // ZV_THEME=dark loads the dark table in place of the light one: it has every code of the
+    // light table, with dark surfaces and light texts.
+    setenv("ZV_THEME", "dark", 1);
+    uxt_theme_color_table_h dark = uxt_theme_add_color_table(kColors.c_str());
+    unsetenv("ZV_THEME");
+    const std::set<std::string> codes = names_after(kColors, "code=\"", 5);
+    ASSERT_GE(codes.size(), 20u);
+    for (const auto &code : codes)
+        EXPECT_GE(luma(dark, code), 0) << code << " missing from the dark table";
+    for (const char *surface : {"AO001", "AO002", "AO018"})
+        EXPECT_LT(luma(dark, surface), luma(colors, surface) - 100) << surface;
+    for (const char *text : {"AO010", "AO011"})
+        EXPECT_GT(luma(dark, text), luma(colors, text) + 100) << text;
+    EXPECT_EQ(uxt_theme_delete_color_table(dark), UXT_ERROR_NONE);
     EXPECT_EQ(uxt_theme_delete_color_table(colors), UXT_ERROR_NONE);
     EXPECT_EQ(uxt_theme_delete_font_table(fonts), UXT_ERROR_NONE);
     EXPECT_EQ(uxt_theme_get_color("AO005", &r, &g, &b, &a), UXT_ERROR_NO_DATA);
@@ -86,31 +100,11 @@ TEST(UxtTables, ApplicationTablesReachEdjeAndObjects)
         EXPECT_EQ(uxt_theme_add_font_table(path.c_str()), nullptr) << path;
     }
     EXPECT_EQ(uxt_theme_add_color_table(nullptr), nullptr);
-}
-
-// ZV_THEME=dark loads the dark table in place of the light one: it has every code of the
-// light table, with dark surfaces and light texts; and every colour and text class the
-// themes use is one of the tables', so that the whole window follows them.
-TEST(UxtTables, DarkTableReplacesTheLightOneEverywhere)
-{
-    uxt_theme_color_table_h light = uxt_theme_add_color_table(kColors.c_str());
-    setenv("ZV_THEME", "dark", 1);
-    uxt_theme_color_table_h dark = uxt_theme_add_color_table(kColors.c_str());
-    unsetenv("ZV_THEME");
-    const std::set<std::string> codes = names_after(kColors, "code=\"", 5);
-    ASSERT_GE(codes.size(), 20u);
-    for (const auto &code : codes)
-        EXPECT_GE(luma(dark, code), 0) << code << " missing from the dark table";
-    for (const char *surface : {"AO001", "AO002", "AO018"})
-        EXPECT_LT(luma(dark, surface), luma(light, surface) - 100) << surface;
-    for (const char *text : {"AO010", "AO011"})
-        EXPECT_GT(luma(dark, text), luma(light, text) + 100) << text;
-    uxt_theme_delete_color_table(light);
-    uxt_theme_delete_color_table(dark);
 
     // The theme sources name no colour class outside the colour table (as a part's colour
-    // class or as a text style's "cc:") and no text class outside the font table.
-    const std::set<std::string> fonts = names_after(kFonts, "class=\"", 4);
+    // class or as a text style's "cc:") and no text class outside the font table, so that the
+    // whole window follows the tables.
+    const std::set<std::string> font_classes = names_after(kFonts, "class=\"", 4);
     for (const auto &entry :
          std::filesystem::recursive_directory_iterator(source_path("res/edje"))) {
         if (entry.path().extension() != ".edc")
@@ -120,7 +114,7 @@ TEST(UxtTables, DarkTableReplacesTheLightOneEverywhere)
             for (size_t at = edc.find(mark); at != std::string::npos; at = edc.find(mark, at + 1)) {
                 size_t from = at + mark.size();
                 std::string name = edc.substr(from, edc.find_first_of("\" ", from) - from);
-                EXPECT_TRUE((mark[0] == 't' ? fonts : codes).count(name))
+                EXPECT_TRUE((mark[0] == 't' ? font_classes : codes).count(name))
                     << entry.path() << " uses " << name;
             }
         }

@@ -14,12 +14,12 @@ namespace {
 using zv_test::http;
 using zv_test::Reply;
 
-// A running zuvo-devserver that ends with status 0 at SIGTERM.
+// A running zuvo-devserver (token T1, API key K1) that ends with status 0 at SIGTERM.
 class DevServerTest : public ::testing::Test {
 protected:
-    void start(const std::vector<std::string> &args = {})
+    void SetUp() override
     {
-        ASSERT_TRUE(server_.start(dir_.path(), args));
+        ASSERT_TRUE(server_.start(dir_.path(), {"--token", "T1", "--api-key", "K1"}));
     }
     void TearDown() override { EXPECT_EQ(server_.stop(), 0); }
 
@@ -63,24 +63,19 @@ TEST(DevServerArgs, WrongCallsExitWithStatusTwo)
 
 // A wrong API key is refused; the token the token endpoint hands out is accepted beside the
 // one given; a data upload whose range does not start at the bytes held is refused. (The
-// service's tests lean on these refusals to see a wrong key or a resent byte.)
-TEST_F(DevServerTest, WrongKeyAndMisplacedRangeAreRefused)
+// service's tests lean on these refusals to see a wrong key or a resent byte.) A fault rule in
+// JSON form acts on its nth request from now; a rule that lacks a value is refused with what
+// it lacks; the rules are cleared. (Rules in query form, their counts and their actions: the
+// client's and the service's fault tests.)
+TEST_F(DevServerTest, WrongKeyAndMisplacedRangeAreRefusedAndFaultsSetByAdminRequest)
 {
-    start({"--token", "T1", "--api-key", "K1"});
     EXPECT_EQ(meta("T1", "wrong").status, 403);
     EXPECT_EQ(meta("zv-dev-access-token").status, 201);
     std::string url = meta().header("Location");
     EXPECT_EQ(put(url, "bytes 0-2999/5000", 3000), 308);
     EXPECT_EQ(put(url, "bytes 2000-4999/5000", 3000), 416);
     EXPECT_EQ(put(url, "bytes 3000-4999/5000", 2000), 201);
-}
 
-// A rule in JSON form acts on its nth request from now; a rule that lacks a value is refused
-// with what it lacks; the rules are cleared. (Rules in query form, their counts and their
-// actions: the client's and the service's fault tests.)
-TEST_F(DevServerTest, FaultsByAdminRequest)
-{
-    start();
     ASSERT_EQ(http("POST", server_.url("/_admin/fault"), {"Content-Type: application/json"},
                    "{\"kind\": \"meta\", \"action\": \"nolocation\", \"nth\": 2}")
                   .status,
