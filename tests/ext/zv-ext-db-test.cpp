@@ -68,7 +68,8 @@ TEST(HistoryStoreTest, RowsRoundTripBesideTheOtherProcessAndTrimPast5000)
     zv_test::TempDir tmp;
     const std::string db = tmp.file("db/.zuvo-history.db");
     const std::string junk(4096, 'x');
-    ASSERT_TRUE(mkdir(tmp.file("db").c_str(), 0700) == 0 && zv_test::write_file(db, junk));
+    ASSERT_EQ(mkdir(tmp.file("db").c_str(), 0700), 0);
+    ASSERT_TRUE(zv_test::write_file(db, junk));
     EXPECT_EQ(zv_ext_db_open(), 0);
     EXPECT_TRUE(g_log.logged("file is not a database"));
     DbItem item{};
@@ -78,7 +79,8 @@ TEST(HistoryStoreTest, RowsRoundTripBesideTheOtherProcessAndTrimPast5000)
     EXPECT_EQ(zv_ext_db_load_ready_item_list(&list), 0);
     EXPECT_EQ(zv_ext_db_get_active_count(), -1);
     EXPECT_EQ(zv_test::read_file(db), junk);
-    ASSERT_TRUE(unlink(db.c_str()) == 0 && rmdir(tmp.file("db").c_str()) == 0);
+    ASSERT_EQ(unlink(db.c_str()), 0);
+    ASSERT_EQ(rmdir(tmp.file("db").c_str()), 0);
     ASSERT_EQ(zv_ext_db_open(), 1);
     EXPECT_EQ(zv_ext_db_open(), 1);
     EXPECT_EQ(load(), "");
