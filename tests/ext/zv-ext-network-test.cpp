@@ -81,10 +81,7 @@ TEST(NetworkTest, KeysReachTheCallbacksAndTheGetters)
     char *ip = zv_ext_network_get_ip();
     EXPECT_STREQ(ip, "10.1.2.3");
     free(ip);
-    const std::string status_file = dir.file("run/vconf/" VCONFKEY_NETWORK_STATUS);
-    ASSERT_TRUE(zv_test::write_file(status_file, "wifi\n"));
-    EXPECT_EQ(zv_ext_network_check(), 0);
-    unlink(status_file.c_str());
+    ASSERT_TRUE(zv_test::write_file(dir.file("run/vconf/" VCONFKEY_NETWORK_STATUS), "wifi\n"));
     EXPECT_EQ(zv_ext_network_check(), 0);
     unlink(dir.file("run/vconf/" VCONFKEY_NETWORK_PROXY).c_str());
     EXPECT_EQ(zv_ext_network_get_proxy(), nullptr);

@@ -65,7 +65,9 @@ TEST(ExtUtilPopup, PopupsTimeOutAndAccountsAreChosen)
     Evas_Object *popup =
         zv_ext_util_create_account_select_popup(win, "Accounts", accounts, select_cb, &chosen);
     EXPECT_STREQ(elm_object_part_text_get(popup, "title,text"), "Accounts");
-    EXPECT_TRUE(a.position == 0 && b.position == 2 && b.user_data == &chosen);
+    EXPECT_EQ(a.position, 0);
+    EXPECT_EQ(b.position, 2);
+    EXPECT_EQ(b.user_data, &chosen);
     Evas_Object *genlist = elm_object_content_get(popup);
     ASSERT_EQ(elm_genlist_items_count(genlist), 2u);
     elm_genlist_item_selected_set(elm_genlist_last_item_get(genlist), EINA_TRUE);

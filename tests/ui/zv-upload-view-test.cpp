@@ -339,8 +339,8 @@ TEST(ViewTest, ListBadgesMenuAndEditMode)
     // A row class called without a job or a part answers nothing: b's and d's are the two.
     for (Elm_Object_Item *item : {b->gen_item, d->gen_item}) {
         const Elm_Genlist_Item_Class *itc = elm_genlist_item_item_class_get(item);
-        EXPECT_TRUE(!itc->func.text_get(nullptr, nullptr, "elm.text.main") &&
-                    !itc->func.content_get(b, nullptr, nullptr));
+        EXPECT_EQ(itc->func.text_get(nullptr, nullptr, "elm.text.main"), nullptr);
+        EXPECT_EQ(itc->func.content_get(b, nullptr, nullptr), nullptr);
     }
 
     EXPECT_EQ(tap({a}), "1 selected, on, 1000");
