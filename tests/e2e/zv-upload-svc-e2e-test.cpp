@@ -62,11 +62,11 @@ class ServiceE2ETest : public E2ETest
 
 TEST_F(ServiceE2ETest, LaterLaunchesAddRowsAndTerminationWritesRowsBack)
 {
-    // The first data upload is slow; the metadata upload of the third row stalls, so that row
-    // is still waiting when the service is terminated.
+    // The first data upload takes a minute; the metadata upload of the third row stalls, so that
+    // row is still waiting when the service is terminated.
     ASSERT_TRUE(start_server({"kind=data,action=throttle,rate=300000,times=1",
                               "kind=meta,action=stall,seconds=60,nth=3"}));
-    int first = record({video("first.mp4", 6000000, 4)}, "First").at(0);
+    int first = record({video("first.mp4", 18000000, 4)}, "First").at(0);
     Child &svc = start_service();
     ASSERT_TRUE(wait_for([&] { return mid_upload(first); }, kLongWaitMs));
     std::string second_file = video("second.mp4", 500000, 5);
