@@ -1,6 +1,7 @@
-// Fixtures of the end-to-end tests: the development server, videos recorded with the
-// companion client, the platform keys the service reads, what the server holds of each row,
-// and the controller in this process with a real window, list view and worker thread.
+// Fixtures of the end-to-end tests and of the controller's own: the development server, videos
+// recorded with the companion client, the platform keys the service reads, what the server
+// holds of each row, and the controller in this process with a real window, list view and
+// worker thread.
 #pragma once
 
 #include <Elementary.h>
