@@ -1,6 +1,7 @@
-// Fixtures of the end-to-end tests: the development server, videos recorded with the
-// companion client, the platform keys the service reads, what the server holds of each row,
-// and the controller in this process with a real window, list view and worker thread.
+// Fixtures of the end-to-end tests and of the controller's own: the development server, videos
+// recorded with the companion client, the platform keys the service reads, what the server
+// holds of each row, and the controller in this process with a real window, list view and
+// worker thread.
 #pragma once
 
 #include <Elementary.h>
@@ -8,7 +9,6 @@
 #include <gtest/gtest.h>
 
 #include <algorithm>
-#include <map>
 #include <random>
 #include <sstream>
 #include <string>
@@ -22,11 +22,7 @@
 namespace zv_e2e
 {
 
-using zv_test::bin_path;
-using zv_test::Logged;
-using zv_test::run_program;
-using zv_test::Upload;
-using zv_test::wait_for;
+using namespace zv_test;
 using namespace zv_upload_test;
 
 constexpr int kLongWaitMs = 60000;
@@ -43,12 +39,10 @@ inline std::vector<int> record(const std::vector<std::string> &files, const std:
         argv.insert(argv.begin(), {"/usr/bin/env", std::string("TSAN_OPTIONS=") + opts});
     argv.insert(argv.end(), files.begin(), files.end());
     argv.insert(argv.end(), {"--title", title});
-    std::string out;
+    std::string out, line;
     std::vector<int> ids;
-    if (run_program(argv, "", &out) != 0)
-        return ids;
-    std::istringstream in(out);
-    for (std::string line; std::getline(in, line);)
+    std::istringstream in(run_program(argv, "", &out) == 0 ? out : "");
+    while (std::getline(in, line))
         ids.push_back(atoi(line.c_str()));
     return ids;
 }
@@ -81,26 +75,25 @@ class E2ETest : public ::testing::Test
         return true;
     }
     // A file of random bytes.
-    std::string video(const std::string &name, size_t bytes, unsigned seed)
+    std::string video(const std::string &name, size_t bytes, unsigned seed = 1)
     {
-        std::string path = dir_.file(name), &data = contents_[path];
+        std::string path = dir_.file(name), data(bytes, '\0');
         std::mt19937 gen(seed);
-        data.resize(bytes);
         for (char &c : data)
             c = static_cast<char>(gen());
-        zv_test::write_file(path, data);
+        EXPECT_TRUE(zv_test::write_file(path, data));
         return path;
     }
-    // Whether every row of ids has this status (now, or within timeout_ms).
-    bool rows_in(const std::vector<int> &ids, int status)
-    {
-        auto rows = stored_rows();
-        return std::all_of(ids.begin(), ids.end(),
-                           [&](int id) { return rows[id].status == status; });
-    }
+    // Whether every row of ids has this status within timeout_ms (0: now).
     bool rows_are(const std::vector<int> &ids, int status, int timeout_ms = kLongWaitMs)
     {
-        return wait_for([&] { return rows_in(ids, status); }, timeout_ms);
+        return wait_for(
+            [&] {
+                auto rows = stored_rows();
+                return std::all_of(ids.begin(), ids.end(),
+                                   [&](int id) { return rows[id].status == status; });
+            },
+            timeout_ms);
     }
     // The server's upload of the row, once the row has its upload address.
     Upload upload_of(int historyid) { return server_.upload_of_url(stored_rows()[historyid].url); }
@@ -109,11 +102,12 @@ class E2ETest : public ::testing::Test
         Upload u = upload_of(historyid);
         return u.held > 0 && !u.complete;
     }
+    // The server holds the row's upload complete, byte for byte the file.
     void expect_identical(int historyid, const std::string &file)
     {
         Upload u = upload_of(historyid);
         ASSERT_TRUE(u.complete) << "upload of " << historyid;
-        EXPECT_TRUE(zv_test::read_file(u.path) == contents_[file]) << "bytes of " << file;
+        EXPECT_EQ(run_program({"/usr/bin/cmp", "-s", file, u.path}), 0) << "bytes of " << file;
     }
     // The upload went on from the server's byte count: one status query, then one data upload
     // of the rest that the server took (it answers 416 to a range that does not start at its
@@ -137,10 +131,9 @@ class E2ETest : public ::testing::Test
 
     zv_test::TempDir dir_;
     zv_test::DevServer server_;
-    std::map<std::string, std::string> contents_;
 };
 
-// The controller in this process against the server.
+// The controller in this process.
 class ControllerFixture : public E2ETest
 {
   protected:
@@ -151,11 +144,12 @@ class ControllerFixture : public E2ETest
             zv_ext_network_deregister();
         }
         E2ETest::TearDown();
-        g_free(ad_.access_token);
-        g_free(ad_.category);
     }
+    // The controller with a window, and the token and category of a launch request.
     void start_controller()
     {
+        ad_.access_token = const_cast<char *>("dev-token");
+        ad_.category = const_cast<char *>("People");
         // The application's theme extension holds the layouts of the list and edit pages.
         char *res = app_get_resource_path();
         elm_theme_extension_add(
@@ -175,13 +169,21 @@ class ControllerFixture : public E2ETest
     void launch()
     {
         zv_upload_ctrl_init_value(&ad_);
-        g_free(ad_.access_token);
-        g_free(ad_.category);
-        ad_.access_token = g_strdup("dev-token");
-        ad_.category = g_strdup("People");
         ASSERT_TRUE(zv_upload_ctrl_service(&ad_));
     }
     UploadItem *job(int historyid) { return _zv_upload_ctrl_find_item_by_id(&ad_, historyid); }
+    // Whether every job of ids, and its row, has this status within timeout_ms (0: now).
+    bool jobs_are(const std::vector<int> &ids, int status, int timeout_ms = kLongWaitMs)
+    {
+        return wait_for(
+            [&] {
+                for (int id : ids)
+                    if (job(id)->status != status)
+                        return false;
+                return rows_are(ids, status, 0);
+            },
+            timeout_ms);
+    }
 
     AppData &ad_ = process_appdata();
     bool started_ = false;

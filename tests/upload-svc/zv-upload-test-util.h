@@ -24,19 +24,19 @@ inline AppData &process_appdata()
     return ad;
 }
 
+// A row of 10 bytes of user@example.com.
 inline bool add_row(int historyid, int status, double date, const char *filename,
                     const char *title = "Clip", const char *url = nullptr, int percent = 0)
 {
-    DbItem row = {};
-    row.historyid = historyid;
-    row.title = const_cast<char *>(title);
-    row.filename = const_cast<char *>(filename);
-    row.filesize = 10;
-    row.percent = percent;
-    row.url = const_cast<char *>(url);
-    row.status = status;
-    row.userid = const_cast<char *>("user@example.com");
-    row.date = date;
+    DbItem row = {historyid,
+                  const_cast<char *>("user@example.com"),
+                  const_cast<char *>(title),
+                  const_cast<char *>(filename),
+                  10,
+                  percent,
+                  const_cast<char *>(url),
+                  status,
+                  date};
     return zv_ext_db_insert_item(&row) == 1;
 }
 
@@ -54,13 +54,10 @@ inline std::map<int, StoredRow> stored_rows()
     GList *list = nullptr;
     zv_ext_db_load_full_item_list(&list);
     for (GList *l = list; l; l = l->next) {
-        const DbItem *row = static_cast<const DbItem *>(l->data);
-        rows[row->historyid] = {row->status,
-                                row->percent,
-                                row->filesize,
-                                row->url ? row->url : "",
-                                row->userid ? row->userid : "",
-                                row->date};
+        const DbItem *r = static_cast<const DbItem *>(l->data);
+        rows[r->historyid] = {
+            r->status, r->percent, r->filesize, r->url ? r->url : "", r->userid ? r->userid : "",
+            r->date};
     }
     if (list)
         zv_ext_db_free_item_list(list);
@@ -72,17 +69,14 @@ inline std::map<std::string, std::string> notification(const std::string &tag)
 {
     std::map<std::string, std::string> keys;
     std::string path = std::string(getenv("ZV_RUNTIME_DIR")) + "/notifications/" + tag + ".ini";
-    GKeyFile *file = g_key_file_new();
-    if (g_key_file_load_from_file(file, path.c_str(), G_KEY_FILE_NONE, nullptr)) {
-        gchar **names = g_key_file_get_keys(file, "notification", nullptr, nullptr);
-        for (gchar **k = names; k && *k; k++) {
-            gchar *value = g_key_file_get_string(file, "notification", *k, nullptr);
-            keys[*k] = value ? value : "";
-            g_free(value);
-        }
-        g_strfreev(names);
+    g_autoptr(GKeyFile) file = g_key_file_new();
+    if (!g_key_file_load_from_file(file, path.c_str(), G_KEY_FILE_NONE, nullptr))
+        return keys;
+    g_auto(GStrv) names = g_key_file_get_keys(file, "notification", nullptr, nullptr);
+    for (gchar **k = names; k && *k; k++) {
+        g_autofree gchar *value = g_key_file_get_string(file, "notification", *k, nullptr);
+        keys[*k] = value ? value : "";
     }
-    g_key_file_free(file);
     return keys;
 }
 
