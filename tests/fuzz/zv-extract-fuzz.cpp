@@ -12,10 +12,8 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t *data, size_t size)
 {
     const std::string input(reinterpret_cast<const char *>(data), size);
     const std::string text = input.c_str(); // up to the first NUL, as the server text would be
-    char *(*const extractors[])(char *) = {
-        zv_plugin_util_get_token_value, zv_plugin_util_get_location_value,
-        zv_plugin_util_get_video_id_value, zv_plugin_util_get_range_value};
-    for (auto extract : extractors) {
+    for (auto extract : {zv_plugin_util_get_token_value, zv_plugin_util_get_location_value,
+                         zv_plugin_util_get_video_id_value, zv_plugin_util_get_range_value}) {
         char *buffer = g_strdup(text.c_str()); // cut in place: each gets a fresh copy
         char *value = extract(buffer);
         if (value && text.find(value) == std::string::npos)

@@ -7,8 +7,6 @@
 #include <stdint.h>
 #include <stdlib.h>
 #include <string.h>
-#include <sys/stat.h>
-#include <unistd.h>
 
 #include <string>
 
@@ -20,13 +18,9 @@ std::string g_tray_path;
 
 void write_file(const std::string &path, const uint8_t *data, size_t size)
 {
-    FILE *f = fopen(path.c_str(), "wb");
-    if (!f)
+    if (!g_file_set_contents_full(path.c_str(), reinterpret_cast<const char *>(data), size,
+                                  G_FILE_SET_CONTENTS_CONSISTENT, 0600, nullptr))
         abort();
-    if (size)
-        fwrite(data, 1, size, f);
-    fclose(f);
-    chmod(path.c_str(), 0600);
 }
 
 } // namespace
@@ -40,9 +34,8 @@ extern "C" int LLVMFuzzerInitialize(int *, char ***)
     setenv("ZV_KEY_STORAGE_DIR", (dir + "/keys").c_str(), 1);
     setenv("ZV_RUNTIME_DIR", (dir + "/run").c_str(), 1);
     setenv("ZV_DLOG_FILE", "/dev/null", 1);
-    mkdir((dir + "/keys").c_str(), 0700);
-    mkdir((dir + "/run").c_str(), 0700);
-    mkdir((dir + "/run/notifications").c_str(), 0700);
+    g_mkdir_with_parents((dir + "/keys").c_str(), 0700);
+    g_mkdir_with_parents((dir + "/run/notifications").c_str(), 0700);
     g_key_path = dir + "/keys/fuzz.entry";
     g_tray_path = dir + "/run/notifications/fuzz_tag.ini";
     return 0;

@@ -11,10 +11,13 @@
 namespace
 {
 
-bool collect(app_control_h, const char *key, void *user_data)
+// Keeps an extra of the request with its value ("" when it has none).
+bool collect(app_control_h request, const char *key, void *user_data)
 {
-    auto *extras = static_cast<std::map<std::string, std::string> *>(user_data);
-    (*extras)[key] = "";
+    char *value = nullptr;
+    app_control_get_extra_data(request, key, &value);
+    (*static_cast<std::map<std::string, std::string> *>(user_data))[key] = value ? value : "";
+    free(value);
     return true;
 }
 
@@ -22,13 +25,6 @@ std::map<std::string, std::string> extras_of(app_control_h request)
 {
     std::map<std::string, std::string> extras;
     app_control_foreach_extra_data(request, collect, &extras);
-    for (auto &kv : extras) {
-        char *value = nullptr;
-        if (app_control_get_extra_data(request, kv.first.c_str(), &value) == APP_CONTROL_ERROR_NONE &&
-            value)
-            kv.second = value;
-        free(value);
-    }
     return extras;
 }
 

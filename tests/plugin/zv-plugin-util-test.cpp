@@ -18,12 +18,12 @@ std::string text(const char *s)
 }
 
 // The size past 4 GiB and that of a missing file go through the data upload (client tests).
-TEST(PluginUtil, MediaTypeFromTheLastExtensionFileNameSizeAndId)
+TEST(PluginUtil, MediaTypeFileNameSizeIdAndTheValuesCutOutOfAnswers)
 {
     // A path longer than the working buffer is cut: its extension past 4095 is lost.
     const std::string cut = std::string(4095, 'a') + ".mp4", fits = std::string(4090, 'a') + ".mp4";
     // clang-format off
-    const std::pair<const char *, const char *> cases[] = { // NULL type: unknown
+    const std::pair<const char *, const char *> types[] = { // NULL type: unknown
         {"/media/DCIM/Clip.MP4", "video/mp4"}, {"/media/a.JPEG", "image/jpeg"},
         {"a.jpg", "image/jpeg"}, {"x.png", "image/png"}, {"x.BMP", "image/bmp"},
         {"x.gif", "image/gif"}, {"x.tiff", "image/tiff"}, {"x.wmv", "video/x-ms-wmv"},
@@ -35,7 +35,7 @@ TEST(PluginUtil, MediaTypeFromTheLastExtensionFileNameSizeAndId)
         {NULL, NULL}, {cut.c_str(), NULL}, {fits.c_str(), "video/mp4"},
     };
     // clang-format on
-    for (auto [path, type] : cases)
+    for (auto [path, type] : types)
         EXPECT_EQ(text(zv_plugin_util_get_file_mime(path)), text(type)) << text(path);
 
     for (auto [path, name] : {std::make_pair<const char *, const char *>("/a/b/c.mp4", "c.mp4"),
@@ -48,10 +48,8 @@ TEST(PluginUtil, MediaTypeFromTheLastExtensionFileNameSizeAndId)
     int64_t before = time(NULL), id = zv_plugin_util_generate_id(), after = time(NULL);
     EXPECT_GE(id, before); // the current second
     EXPECT_LE(id, after);
-}
 
-TEST(PluginUtil, ExtractorsCutTheirValueOutOfTheAnswer)
-{
+    // The extractors of the server's answers.
     const auto loc = zv_plugin_util_get_location_value, etag = zv_plugin_util_get_video_id_value,
                range = zv_plugin_util_get_range_value, token = zv_plugin_util_get_token_value;
     // clang-format off
