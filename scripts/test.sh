@@ -7,7 +7,7 @@
 #   3. the engine, client and controller tests, the stress test among them, under
 #      ThreadSanitizer (build-tsan/),
 #   4. every fuzz target for a few seconds on its seed corpus (build-fuzz/, clang),
-# and prints one reliability report at the end. It fails when the tests grow past 0.45 of the
+# and prints one reliability report at the end. It fails when the tests grow past 0.345 of the
 # product's lines (scripts/test-size.sh; the ceiling comes down as tests are merged).
 # CI=true turns warnings into errors.
 # ZV_TEST_STAGES picks stages (default "plain asan tsan fuzz").
@@ -40,7 +40,7 @@ status=0
 
 # The tests may not grow past the product's size times this ratio (the figures are in the
 # report). It only ever comes down, towards a third, as tests are merged.
-size_max=0.45
+size_max=0.345
 if ! bash scripts/test-size.sh --max "$size_max" >"$ZV_REPORT_DIR/size.txt" 2>&1; then
   status=1
 fi
@@ -110,7 +110,7 @@ if [[ " $stages " == *" tsan "* ]]; then
   export ZV_COMPANION_TSAN_OPTIONS="halt_on_error=1:suppressions=$top/tests/sanitizers/tsan-companion.supp"
   TSAN_OPTIONS="halt_on_error=1:second_deadlock_stack=1:suppressions=$top/tests/sanitizers/tsan.supp" \
     run_suite "thread: engine, client, controller" build-tsan \
-    -R '^(Engine|ClientTest|AccountTest|RunningUploadTest|UploadCtrlTest|CtrlE2ETest|ServiceE2ETest)'
+    -R '^(Engine|ClientTest|RunningUploadTest|UploadCtrlTest|CtrlE2ETest|ServiceE2ETest)'
   # The stress test again with two more seeds (each run prints its seed in the report).
   for seed in ${ZV_STRESS_SEEDS:-7 4242}; do
     ZV_STRESS_SEED=$seed ZV_LOG_SUFFIX="-stress-$seed" \
