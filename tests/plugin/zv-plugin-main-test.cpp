@@ -76,11 +76,7 @@ protected:
     {
         g_log.mark();
         ASSERT_TRUE(zv_init_service());
-        const std::string cert = tmp_.file("cert.pem"), key = tmp_.file("key.pem");
-        zv_test::run_program({"/usr/bin/openssl", "req", "-x509", "-newkey", "ec", "-pkeyopt",
-                              "ec_paramgen_curve:prime256v1", "-nodes", "-keyout", key, "-out",
-                              cert, "-days", "2", "-subj", "/CN=127.0.0.1", "-addext",
-                              "subjectAltName=IP:127.0.0.1"});
+        const std::string cert = tls_dir().file("cert.pem"), key = tls_dir().file("key.pem");
         ASSERT_TRUE(server_.start(tmp_.file("server"),
                                   {"--token", TOKEN, "--api-key", API_KEY, "--tls-port", "0",
                                    "--tls-cert", cert, "--tls-key", key, "--issued-token",
@@ -99,6 +95,19 @@ protected:
         ASSERT_TRUE(zv_test::write_file(clip_, bytes));
     }
     void TearDown() override { zv_finalize_service(); }
+
+    // The server's certificate and key for 127.0.0.1, made once for every test of the program.
+    static const zv_test::TempDir &tls_dir()
+    {
+        static const zv_test::TempDir dir(false);
+        static const int made = zv_test::run_program(
+            {"/usr/bin/openssl", "req", "-x509", "-newkey", "ec", "-pkeyopt",
+             "ec_paramgen_curve:prime256v1", "-nodes", "-keyout", dir.file("key.pem"), "-out",
+             dir.file("cert.pem"), "-days", "2", "-subj", "/CN=127.0.0.1", "-addext",
+             "subjectAltName=IP:127.0.0.1"});
+        EXPECT_EQ(made, 0) << "openssl could not make the test certificate";
+        return dir;
+    }
 
     // Messages the client (not the engine) logged at error level since the test began.
     std::vector<std::string> errors() const
