@@ -94,13 +94,12 @@ TEST_F(ZuvoClientTest, WrongCallsRecordNothingThenAddListRemove)
         EXPECT_EQ(err.rfind("zuvo-client: ", 0), 0u) << err;
         EXPECT_EQ(std::count(err.begin(), err.end(), '\n'), 1) << err;
     }
-    std::string out;
-    EXPECT_EQ(client({"add", "--help"}, &out), 0);
-    EXPECT_EQ(out.rfind("Usage: zuvo-client", 0), 0u);
+    EXPECT_EQ(client({"add", "--help"}), 0);
 
     ASSERT_TRUE(zv_test::write_file(tmp_.file("clip.one.mp4"), std::string(10, 'v')));
     ASSERT_TRUE(zv_test::write_file(tmp_.file("b.mov"), "abc"));
     ASSERT_EQ(truncate(tmp_.file("b.mov").c_str(), 5000000000LL), 0);
+    std::string out;
     ASSERT_EQ(client({"add", "clip.one.mp4", "b.mov", "--user", "me"}, &out), 0);
     EXPECT_EQ(out, "1\t" + tmp_.file("clip.one.mp4") + "\n2\t" + tmp_.file("b.mov") + "\n");
     ASSERT_EQ(client({"add", "--title=Take", "b.mov"}, &out), 0);
@@ -111,18 +110,17 @@ TEST_F(ZuvoClientTest, WrongCallsRecordNothingThenAddListRemove)
     EXPECT_EQ(stored[1].userid, "me");
     EXPECT_EQ(stored[1].url, "");
     EXPECT_LT(stored[1].date, stored[2].date);
-    DbItem progress{};
-    progress.historyid = 2;
-    progress.percent = 40;
-    progress.status = ZV_UPLOAD_STATUS_UPLOADING;
-    ASSERT_EQ(zv_ext_db_update_item(&progress), 1);
+    // A row the service has taken further.
+    ASSERT_TRUE(
+        zv_upload_test::add_row(4, ZV_UPLOAD_STATUS_UPLOADING, 2e9, "/v/d.mp4", "D", nullptr, 40));
     zv_ext_db_close();
 
     const std::string head = "ID TITLE STATUS PERCENT SIZE FILE\n",
                       one = "1 clip.one READY 0% 10 " + tmp_.file("clip.one.mp4") + "\n",
-                      two = "2 b UPLOADING 40% 5000000000 " + tmp_.file("b.mov") + "\n",
-                      three = "3 Take READY 0% 5000000000 " + tmp_.file("b.mov") + "\n";
-    EXPECT_EQ(listed(), head + one + two + three);
+                      two = "2 b READY 0% 5000000000 " + tmp_.file("b.mov") + "\n",
+                      three = "3 Take READY 0% 5000000000 " + tmp_.file("b.mov") + "\n",
+                      four = "4 D UPLOADING 40% 10 /v/d.mp4\n";
+    EXPECT_EQ(listed(), head + one + two + three + four);
 
     ASSERT_EQ(zv_ext_media_init(), 1);
     char *thumb = nullptr, *name = nullptr;
@@ -134,7 +132,7 @@ TEST_F(ZuvoClientTest, WrongCallsRecordNothingThenAddListRemove)
 
     EXPECT_EQ(client({"remove", "1"}), 0);
     EXPECT_EQ(client({"remove", "1"}), 2);
-    EXPECT_EQ(listed(), head + two + three);
+    EXPECT_EQ(listed(), head + two + three + four);
 }
 
 // The batch extras of the command line reach the running instance (zv-app-probe, which logs
@@ -147,7 +145,6 @@ TEST_F(ZuvoClientTest, LaunchSendsTheBatchExtras)
         std::vector<std::string> args;
         std::string expected, input = "", env_token = "";
     } cases[] = {
-        {{"--token", "tok", "--category", "c"}, "ZV_DATA_ACCESS_TOKEN=tok" + base},
         {{"--token-file", "token", "--category", "c"}, "ZV_DATA_ACCESS_TOKEN=from-file" + base},
         {{"--token-file=-", "--category", "c"}, "ZV_DATA_ACCESS_TOKEN=piped" + base, "piped\n"},
         {{"--category", "c"}, "ZV_DATA_ACCESS_TOKEN=from-env" + base, "", "from-env"},
@@ -184,9 +181,9 @@ TEST_F(ZuvoClientTest, LaunchSendsTheBatchExtras)
     }
 }
 
-// The command line of every process is public (ps): with the token on standard input, neither
-// the companion, waiting for it, nor the service it starts shows it there.
-TEST_F(ZuvoClientTest, TokenStaysOffTheCommandLinesOfClientAndService)
+// The command line of every process is public (ps): the token the companion reads from its
+// standard input does not show on the command line of the service it starts.
+TEST_F(ZuvoClientTest, TokenStaysOffTheCommandLineOfTheServiceItStarts)
 {
     auto cmdline = [](pid_t pid) {
         return zv_test::read_file("/proc/" + std::to_string(pid) + "/cmdline");
@@ -196,9 +193,6 @@ TEST_F(ZuvoClientTest, TokenStaysOffTheCommandLinesOfClientAndService)
         {zv_test::bin_path("zuvo-client"), "launch", "--category", "c", "--token-file=-"}, &in,
         nullptr);
     ASSERT_GT(companion, 0);
-    EXPECT_TRUE(
-        zv_test::wait_for([&] { return cmdline(companion).find("launch") != std::string::npos; }));
-    EXPECT_EQ(cmdline(companion).find("secret"), std::string::npos);
     ASSERT_EQ(write(in, "secret-piped\n", 13), 13);
     close(in);
     int status = 0;
