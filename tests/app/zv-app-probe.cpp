@@ -33,7 +33,6 @@ bool on_create(void *)
     if (getenv("ZV_PROBE_FAIL_CREATE"))
         return false;
     g_win = elm_win_add(nullptr, "zuvo-upload-svc", ELM_WIN_BASIC);
-    evas_object_resize(g_win, 360, 640);
     evas_object_show(g_win);
     return true;
 }

@@ -4,8 +4,8 @@
 
 #include <glib.h>
 #include <gtest/gtest.h>
+#include <stdio.h>
 #include <stdlib.h>
-#include <unistd.h>
 
 #include <string>
 

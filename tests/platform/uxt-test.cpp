@@ -54,7 +54,6 @@ TEST(UxtTables, ApplicationAndDarkTablesReachEdjeObjectsAndThemes)
     ASSERT_NE(colors, nullptr);
     ASSERT_NE(fonts, nullptr);
     int r, g, b, a, er, eg, eb, ea, x;
-    EXPECT_EQ(uxt_theme_get_color("AO005", &r, &g, &b, &a), UXT_ERROR_NO_DATA); // not current yet
     ASSERT_EQ(uxt_theme_set_color_table(colors), UXT_ERROR_NONE);
     ASSERT_EQ(uxt_theme_set_font_table(fonts), UXT_ERROR_NONE);
     EXPECT_EQ(uxt_theme_get_color("ZZ999", &r, &g, &b, &a), UXT_ERROR_NO_DATA);

@@ -8,7 +8,6 @@
 #include <algorithm>
 #include <filesystem>
 #include <string>
-#include <vector>
 
 #include "zv-test-util.h"
 
@@ -62,8 +61,7 @@ TEST(Vconf, KeyFilesReadingRulesWatchAndTool)
         {"-7", "-7 -7"}, // no newline at all
         {"12\n\n", "- 12\n"},
         {"abc", "- abc"},
-        {"3x", "- 3x"},
-        {"", "- "},
+        {"", "- "}, // an empty file, not even a newline
         {"99999999999", "- 99999999999"},
     };
     for (const auto &c : cases) {
