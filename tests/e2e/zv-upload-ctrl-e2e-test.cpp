@@ -49,19 +49,6 @@ TEST_F(CtrlE2ETest, NetworkEventPausesRunningUploadsAndUploadAgainContinuesInThe
     expect_identical(ids[1], b);
     expect_continued(ids[0], 3000000);
     expect_continued(ids[1], 2500000);
-    EXPECT_EQ(stored_rows()[ids[0]].percent, 100);
-}
-
-// The first visible widget of a type on the window's canvas.
-Evas_Object *find_widget(Evas_Object *win, const char *type)
-{
-    for (Evas_Object *o = evas_object_bottom_get(evas_object_evas_get(win)); o;
-         o = evas_object_above_get(o)) {
-        const char *t = elm_object_widget_check(o) ? elm_object_widget_type_get(o) : nullptr;
-        if (t && strcmp(t, type) == 0 && evas_object_visible_get(o))
-            return o;
-    }
-    return nullptr;
 }
 
 // Thirty uploads side by side while network events, pauses and resumes from the badge,
@@ -120,9 +107,16 @@ TEST_F(CtrlE2ETest, StressOfThirtyJobsWithEventsAtRandomMoments)
         done = done ? done : elm_object_item_part_content_get(page, "next_btn");
         ASSERT_NE(done, nullptr);
         evas_object_smart_callback_call(done, "clicked", nullptr);
-        if (Evas_Object *popup = find_widget(ad_.win, "Elm_Popup"))
-            evas_object_smart_callback_call(elm_object_part_content_get(popup, "button2"),
-                                            "clicked", nullptr);
+        // The question, when it comes, is the visible popup on the window's canvas.
+        for (Evas_Object *o = evas_object_bottom_get(evas_object_evas_get(ad_.win)); o;
+             o = evas_object_above_get(o)) {
+            const char *t = elm_object_widget_check(o) ? elm_object_widget_type_get(o) : nullptr;
+            if (t && strcmp(t, "Elm_Popup") == 0 && evas_object_visible_get(o)) {
+                evas_object_smart_callback_call(elm_object_part_content_get(o, "button2"),
+                                                "clicked", nullptr);
+                break;
+            }
+        }
         ASSERT_TRUE(wait_for([&] { return ad_.pEditLayout == nullptr; }));
     };
     std::vector<int> more;
@@ -203,10 +197,6 @@ TEST_F(FaultE2ETest, DataUploadRefusedAndCutAtTwentyOffsetsAndStatusQueryFaults)
     printf("fault seed %u (ZV_FAULT_SEED replays it)\n", seed);
     std::mt19937 rng(seed);
     const long long size = 3000000;
-    auto cut_rule = [&](long long left) {
-        long long k = std::uniform_int_distribution<long long>(1, std::max(1LL, left / 4))(rng);
-        return "kind=data&action=cut&bytes=" + std::to_string(k);
-    };
     const struct {
         const char *rule, *action;
         int wait_ms;
@@ -228,7 +218,10 @@ TEST_F(FaultE2ETest, DataUploadRefusedAndCutAtTwentyOffsetsAndStatusQueryFaults)
     ASSERT_TRUE(server_.clear_faults());
     long long held = 0;
     for (int cut = 0; cut < 20; ++cut) {
-        ASSERT_TRUE(server_.add_fault(cut_rule(size - held)));
+        // Cut after up to a quarter of what is left.
+        long long k =
+            std::uniform_int_distribution<long long>(1, std::max(1LL, (size - held) / 4))(rng);
+        ASSERT_TRUE(server_.add_fault("kind=data&action=cut&bytes=" + std::to_string(k)));
         ad_.resume_upload(&ad_, job(id));
         ASSERT_TRUE(wait_for([&] { return server_.fired("cut") == cut + 1; }, kLongWaitMs));
         ASSERT_TRUE(rows_are({id}, ZV_UPLOAD_STATUS_PAUSED)) << "cut " << cut;
@@ -245,14 +238,6 @@ TEST_F(FaultE2ETest, DataUploadRefusedAndCutAtTwentyOffsetsAndStatusQueryFaults)
             ASSERT_TRUE(jobs_are({id}, ZV_UPLOAD_STATUS_PAUSED, f.wait_ms)) << f.rule;
         }
     }
-    // The upload again opens the file anew: gone, the job stays paused and says why.
-    ASSERT_EQ(rename(file.c_str(), (file + ".away").c_str()), 0);
-    ad_.resume_upload(&ad_, job(id));
-    std::string why = "file of " + std::to_string(id) + " is missing";
-    ASSERT_TRUE(wait_for([&] { return g_test_log.logged(why); }, kLongWaitMs));
-    EXPECT_EQ(job(id)->status, ZV_UPLOAD_STATUS_PAUSED);
-    ASSERT_EQ(rename((file + ".away").c_str(), file.c_str()), 0);
-
     // The last upload again completes: the server's copy is identical, no data upload sent a
     // byte the server held, and the bar, set back first, is drawn to its end (even with less
     // than one read of the file left, when the first report only makes the job UPLOADING).
@@ -286,7 +271,6 @@ TEST_F(FaultE2ETest, DataUploadRefusedAndCutAtTwentyOffsetsAndStatusQueryFaults)
     expect_identical(id, file);
     for (const Logged &r : server_.requests())
         EXPECT_NE(r.status, 416) << "a data upload sent bytes the server held";
-    EXPECT_EQ(stored_rows()[id].percent, 100);
     ASSERT_FALSE(values.empty()) << "the bar never moved after the upload again";
     EXPECT_DOUBLE_EQ(values.back(), 1.0);
 }

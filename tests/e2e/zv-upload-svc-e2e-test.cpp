@@ -92,14 +92,6 @@ TEST_F(ServiceE2ETest, LaterLaunchesAddRowsAndTerminationWritesRowsBack)
     EXPECT_EQ(rows[third].status, ZV_UPLOAD_STATUS_READY);
     EXPECT_TRUE(notification("zuvo_ongoing_noti").empty());
     EXPECT_TRUE(logged("get bundle value fail"));
-    // The running upload went on undisturbed: one data upload, logged once it ended.
-    auto data_uploads = [&] {
-        auto all = server_.requests_of(upload_of(first).id);
-        return std::count_if(all.begin(), all.end(),
-                             [](const Logged &r) { return r.kind == "data"; });
-    };
-    ASSERT_TRUE(wait_for([&] { return data_uploads() > 0; }, kLongWaitMs));
-    EXPECT_EQ(data_uploads(), 1);
 }
 
 // The service is killed mid-upload and started again: the rest goes in one data upload behind
@@ -142,6 +134,8 @@ TEST_F(ServiceE2ETest, KilledMidUploadResumesWithStatusQueryAtNextStart)
         {std::string("kind=data,action=throttle,rate=") + (large ? "134217728" : "300000")}));
     int id = record({file}, "Long").at(0);
     Child &first = start_service();
+    // The server's copy is watched on disk: its listing hashes every copy, too slow to poll
+    // across the kill point.
     std::string copy;
     ASSERT_TRUE(wait_for([&] { return !(copy = upload_of(id).path).empty(); }, kLongWaitMs));
     struct stat st = {};
@@ -176,16 +170,9 @@ TEST_F(ServiceE2ETest, BatchPastTheOpenFileLimitCompletes)
     Child &svc = start_service(kBatch, 128);
     ASSERT_TRUE(rows_are(ids, ZV_UPLOAD_STATUS_COMPLETED, 4 * kLongWaitMs));
     auto rows = stored_rows();
-    std::map<std::string, Upload> by_url;
-    for (const Upload &u : server_.uploads())
-        by_url[u.url] = u;
     for (int id : ids) {
-        const Upload &u = by_url[rows[id].url];
         EXPECT_EQ(rows[id].percent, 100);
-        EXPECT_TRUE(u.complete &&
-                    zv_test::read_file(u.path) ==
-                        zv_test::read_file(dir_.file("v" + std::to_string(id) + ".mp4")))
-            << id;
+        expect_identical(id, dir_.file("v" + std::to_string(id) + ".mp4"));
     }
     EXPECT_FALSE(logged("Too many open files"));
     ASSERT_TRUE(wait_for([&] { return notification("zuvo_ongoing_noti").empty(); }, kLongWaitMs));

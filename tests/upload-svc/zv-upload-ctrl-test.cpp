@@ -75,6 +75,8 @@ class UploadCtrlTest : public ControllerFixture
 // launch again, and a row loaded twice is one job below).
 TEST_F(UploadCtrlTest, LoadsPutNewestFirstAndTakeReadyRowsAsWaiting)
 {
+    EXPECT_EQ(job(1), nullptr);
+    EXPECT_TRUE(g_test_log.logged("list is NULL"));
     ASSERT_TRUE(add_row(1, ZV_UPLOAD_STATUS_READY, 1.0, "/v/one.mp4", "One"));
     ASSERT_TRUE(
         add_row(3, ZV_UPLOAD_STATUS_COMPLETED, 3.0, "/v/three.mp4", "Three", "http://up/3", 100));
@@ -92,26 +94,6 @@ TEST_F(UploadCtrlTest, LoadsPutNewestFirstAndTakeReadyRowsAsWaiting)
     EXPECT_STREQ(job(2)->userid, "user@example.com");
     EXPECT_EQ(job(2)->percent, 40);
     EXPECT_EQ(job(2)->handle, nullptr);
-}
-
-TEST_F(UploadCtrlTest, FindersTakeTheFirstMatchAndSkipNullEntries)
-{
-    UploadItem first = {}, second = {};
-    first.historyid = second.historyid = 5;
-    second.handle = zv_request_new();
-    for (UploadItem *item : {(UploadItem *)nullptr, &first, &second})
-        ad_.job_list = g_list_append(ad_.job_list, item);
-
-    EXPECT_EQ(job(5), &first);
-    EXPECT_EQ(job(7), nullptr);
-    EXPECT_EQ(_zv_upload_ctrl_find_item(&ad_, second.handle), &second);
-    EXPECT_EQ(_zv_upload_ctrl_find_item(&ad_, nullptr), nullptr);
-    EXPECT_TRUE(g_test_log.logged("Skip NULL item : 0"));
-    g_list_free(ad_.job_list);
-    ad_.job_list = nullptr;
-    EXPECT_EQ(job(5), nullptr);
-    EXPECT_TRUE(g_test_log.logged("list is NULL"));
-    zv_request_free(second.handle);
 }
 
 TEST_F(UploadCtrlTest, NotificationsFollowTheCounters)
@@ -165,6 +147,7 @@ TEST_F(UploadCtrlTest, RowsThatCannotBeSentEndPausedAndSayWhy)
         ASSERT_TRUE(
             add_row(id, ZV_UPLOAD_STATUS_READY, id, files[id - 1], id == 5 ? nullptr : "C"));
     ASSERT_TRUE(add_row(8, ZV_UPLOAD_STATUS_PAUSED, 8, good.c_str(), "Never sent"));
+    ASSERT_TRUE(add_row(9, ZV_UPLOAD_STATUS_PAUSED, 9, missing.c_str(), "Gone", url_.c_str()));
     start_controller();
     launch();
     ASSERT_TRUE(jobs_are({1, 2, 3, 4, 5, 6, 7}, ZV_UPLOAD_STATUS_PAUSED));
@@ -182,33 +165,31 @@ TEST_F(UploadCtrlTest, RowsThatCannotBeSentEndPausedAndSayWhy)
     EXPECT_NE(second, std::string::npos) << "the rows past 4 GiB and the good one send";
     EXPECT_EQ(log.find(sent, second + 1), std::string::npos) << "no other row sends";
 
-    // Upload again on a row that never got its address stays paused.
+    // Upload again on a row that never got its address, or whose file is gone, stays paused
+    // (the file is looked at anew).
     g_test_log.mark();
+    ad_.resume_upload(&ad_, job(9));
+    EXPECT_TRUE(g_test_log.logged("file of 9 is missing: " + missing));
     ad_.resume_upload(&ad_, job(8));
     ASSERT_TRUE(wait_for([] { return g_test_log.logged("It need to update notification"); }));
     EXPECT_TRUE(g_test_log.logged("zv_set_attr_upload_url fail: -983"));
-    EXPECT_TRUE(jobs_are({8}, ZV_UPLOAD_STATUS_PAUSED, 0));
+    EXPECT_TRUE(jobs_are({8, 9}, ZV_UPLOAD_STATUS_PAUSED, 0));
 
-    // A status answer that names no byte of the file (last byte index 99) pauses its job
-    // without a data upload.
-    const char *ranges[] = {"100", "5000000000", "-1", "12abc", "99999999999999999999"};
-    for (int id = 11; id <= 15; id++)
-        ASSERT_TRUE(add_row(id, ZV_UPLOAD_STATUS_PAUSED, id, good.c_str(), "Clip", url_.c_str()));
+    // A status answer that names no byte of the file (last byte index 99: past it, signed,
+    // not a number, past 64 bits) pauses the job without a data upload.
+    ASSERT_TRUE(add_row(11, ZV_UPLOAD_STATUS_PAUSED, 11, good.c_str(), "Clip", url_.c_str()));
     zv_upload_list_load_full_item(&ad_); // takes only the rows that are not jobs yet
-    for (int id = 11; id <= 15; id++) {
-        ad_.resume_upload(&ad_, job(id));
-        answer(job(id), ZV_RESP_TYPE_UPLOAD_QUERY, ZV_ERROR_NONE, ranges[id - 11]);
-    }
-    ASSERT_TRUE(jobs_are({11, 12, 13, 14, 15}, ZV_UPLOAD_STATUS_PAUSED));
-    for (int id = 11; id <= 15; id++) {
-        EXPECT_TRUE(g_test_log.logged("Range of " + std::to_string(id) +
-                                      " names no byte of its file (100 bytes): \"" +
-                                      ranges[id - 11] + "\""));
-        EXPECT_EQ(job(id)->handle->resp_type, ZV_RESP_TYPE_UPLOAD_QUERY) << "no data upload";
+    for (std::string range : {"100", "-1", "12abc", "99999999999999999999"}) {
+        ad_.resume_upload(&ad_, job(11));
+        answer(job(11), ZV_RESP_TYPE_UPLOAD_QUERY, ZV_ERROR_NONE, range.c_str());
+        ASSERT_TRUE(jobs_are({11}, ZV_UPLOAD_STATUS_PAUSED)) << range;
+        EXPECT_TRUE(g_test_log.logged("Range of 11 names no byte of its file (100 bytes): \"" +
+                                      range + "\""));
+        EXPECT_EQ(job(11)->handle->resp_type, ZV_RESP_TYPE_UPLOAD_QUERY) << "no data upload";
     }
 }
 
-TEST_F(UploadCtrlTest, PauseBeforeTheUploadMessageKeepsTheJobPausedAndOneAnswerStartsOneUpload)
+TEST_F(UploadCtrlTest, PauseBeforeTheUploadMessageHoldsAndUploadsAndCompletionsAreTakenOnce)
 {
     std::string file = video("a.mp4", 1000);
     ASSERT_TRUE(add_row(1, ZV_UPLOAD_STATUS_READY, 1, file.c_str()));
@@ -225,6 +206,14 @@ TEST_F(UploadCtrlTest, PauseBeforeTheUploadMessageKeepsTheJobPausedAndOneAnswerS
     ASSERT_EQ(a->status, ZV_UPLOAD_STATUS_WAITING);
     ServiceRequest *meta = a->handle;
     ASSERT_NE(meta, nullptr);
+    // The finders skip an empty entry of the list; an unknown id or a null handle finds no
+    // job.
+    ad_.job_list = g_list_prepend(ad_.job_list, nullptr);
+    EXPECT_EQ(_zv_upload_ctrl_find_item(&ad_, meta), a);
+    EXPECT_TRUE(g_test_log.logged("Skip NULL item : 0"));
+    EXPECT_EQ(job(7), nullptr);
+    EXPECT_EQ(_zv_upload_ctrl_find_item(&ad_, nullptr), nullptr);
+    ad_.job_list = g_list_delete_link(ad_.job_list, ad_.job_list);
     // A network event while the metadata upload is out leaves the job waiting.
     _zv_upload_ctrl_net_status_cb(2, &ad_);
     drain();
@@ -263,21 +252,15 @@ TEST_F(UploadCtrlTest, PauseBeforeTheUploadMessageKeepsTheJobPausedAndOneAnswerS
     launch();
     drain();
     EXPECT_EQ(a->handle, data);
-}
 
-// The first progress report (change pipe) and the completion (complete pipe) of a one-job
-// batch, read in both orders. Pause and upload again leave the job alone once it completed,
-// even before its completion is read, as they leave a job loaded completed.
-TEST_F(UploadCtrlTest, CompletionIsCountedOnceAndCompletedJobsIgnorePauseAndResume)
-{
-    ASSERT_TRUE(add_row(1, ZV_UPLOAD_STATUS_COMPLETED, 1, "/v/1", "Done", "http://up/1", 100));
-    start_controller();
-    launch();
+    // The first progress report (change pipe) and the completion (complete pipe) of a one-job
+    // batch, read in both orders: this job's, then another's. Pause and upload again leave
+    // the job alone once it completed, even before its completion is read.
     for (int complete_first : {0, 1}) {
         SCOPED_TRACE(complete_first ? "complete pipe first" : "change pipe first");
-        int id = 10 + complete_first;
+        int id = complete_first ? 11 : 1;
         unlink(dir_.file("run/notifications/zuvo_complete_noti.ini").c_str());
-        UploadItem *j = resumed(id);
+        UploadItem *j = complete_first ? resumed(id) : a;
         _zv_upload_ctrl_progress_cb(j->handle, 100, &ad_);
         answer(j, ZV_RESP_TYPE_DATA_UPLOAD, ZV_ERROR_NONE);
         _zv_upload_ctrl_progress_cb(j->handle, 50, &ad_); // a late report moves nothing
@@ -292,13 +275,11 @@ TEST_F(UploadCtrlTest, CompletionIsCountedOnceAndCompletedJobsIgnorePauseAndResu
         EXPECT_TRUE(notification("zuvo_ongoing_noti").empty());
         EXPECT_EQ(ad_.completed_count, 0);
         EXPECT_EQ(j->percent, 100);
-        for (int done : {1, id}) {
-            ServiceRequest *handle = job(done)->handle;
-            ad_.pause_upload(&ad_, job(done));
-            ad_.resume_upload(&ad_, job(done));
-            EXPECT_EQ(job(done)->handle, handle);
-            EXPECT_TRUE(jobs_are({done}, ZV_UPLOAD_STATUS_COMPLETED, 0));
-        }
+        ServiceRequest *handle = j->handle;
+        ad_.pause_upload(&ad_, j);
+        ad_.resume_upload(&ad_, j);
+        EXPECT_EQ(j->handle, handle);
+        EXPECT_TRUE(jobs_are({id}, ZV_UPLOAD_STATUS_COMPLETED, 0));
     }
 }
 
