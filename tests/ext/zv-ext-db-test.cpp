@@ -77,7 +77,6 @@ TEST(HistoryStoreTest, RowsRoundTripBesideTheOtherProcessAndTrimPast5000)
     EXPECT_EQ(zv_ext_db_insert_item(&item), 0);
     EXPECT_EQ(zv_ext_db_delete_item(1), 0);
     EXPECT_EQ(zv_ext_db_load_ready_item_list(&list), 0);
-    EXPECT_EQ(zv_ext_db_get_active_count(), -1);
     EXPECT_EQ(zv_test::read_file(db), junk);
     ASSERT_EQ(unlink(db.c_str()), 0);
     ASSERT_EQ(rmdir(tmp.file("db").c_str()), 0);
@@ -106,7 +105,6 @@ TEST(HistoryStoreTest, RowsRoundTripBesideTheOtherProcessAndTrimPast5000)
     EXPECT_EQ(update(2, 55, ZV_UPLOAD_STATUS_READY, "http://upload/2"), 1);
     release.join();
     sqlite3_close(other);
-    EXPECT_FALSE(g_log.logged("SQLITE_BUSY"));
 
     const std::string one = "1 - /v/a.mp4 5000000000 - 7 4 - 10.25\n",
                       three = "3 third /v/a.mp4 5000000000 http://u/3 7 0 me 30.5\n";
