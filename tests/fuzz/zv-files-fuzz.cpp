@@ -6,7 +6,6 @@
 #include <key_storage.h>
 #include <stdint.h>
 #include <stdlib.h>
-#include <string.h>
 
 #include <string>
 

@@ -448,7 +448,6 @@ TEST_F(ClientTest, CategoryLabelsInDocumentOrderWithLanguageFallback)
         {"200", labelled.c_str(), {"Film", "Music & Dance", "Sports"}},
         {"200", "<feed><category label=\"Film\"/></feed>", {}}, // another root
         {"200", "Film, Music", {}},                             // not XML
-        {"404", "", {}},
     };
     for (const auto &c : cases) {
         ASSERT_TRUE(server_.clear_faults());
