@@ -7,8 +7,8 @@
 #   3. the engine, client and controller tests, the stress test among them, under
 #      ThreadSanitizer (build-tsan/),
 #   4. every fuzz target for a few seconds on its seed corpus (build-fuzz/, clang),
-# and prints one reliability report at the end. It fails when the tests grow past 0.345 of the
-# product's lines (scripts/test-size.sh; the ceiling comes down as tests are merged).
+# and prints one reliability report at the end. It fails when the tests grow past 0.34 of the
+# product's lines (scripts/test-size.sh).
 # CI=true turns warnings into errors.
 # ZV_TEST_STAGES picks stages (default "plain asan tsan fuzz").
 set -euo pipefail
@@ -40,7 +40,7 @@ status=0
 
 # The tests may not grow past the product's size times this ratio (the figures are in the
 # report). It only ever comes down, towards a third, as tests are merged.
-size_max=0.345
+size_max=0.34
 if ! bash scripts/test-size.sh --max "$size_max" >"$ZV_REPORT_DIR/size.txt" 2>&1; then
   status=1
 fi

@@ -157,10 +157,11 @@ TEST_F(ServiceE2ETest, KilledMidUploadResumesWithStatusQueryAtNextStart)
 
 // Under an open-file limit of 128 (soft and hard), far below what 200 jobs at once would hold,
 // the batch completes: every copy byte-identical, no descriptor missing anywhere, the tray
-// ends with the completion alone, and no secret is left anywhere.
+// ends with the completion alone, and no secret is left anywhere. The server takes each data
+// upload slowly (half a second), so that the uploads really wait for one another.
 TEST_F(ServiceE2ETest, BatchPastTheOpenFileLimitCompletes)
 {
-    ASSERT_TRUE(start_server());
+    ASSERT_TRUE(start_server({"kind=data,action=throttle,rate=40000,times=0"}));
     std::vector<int> ids;
     for (int id = 1; id <= 200; id++) {
         std::string file = video("v" + std::to_string(id) + ".mp4", 20000, 100 + id);
@@ -175,6 +176,7 @@ TEST_F(ServiceE2ETest, BatchPastTheOpenFileLimitCompletes)
         expect_identical(id, dir_.file("v" + std::to_string(id) + ".mp4"));
     }
     EXPECT_FALSE(logged("Too many open files"));
+    EXPECT_TRUE(logged("transfers at once"));
     ASSERT_TRUE(wait_for([&] { return notification("zuvo_ongoing_noti").empty(); }, kLongWaitMs));
     auto complete = notification("zuvo_complete_noti");
     EXPECT_NE(complete["title"].find("200"), std::string::npos) << complete["title"];

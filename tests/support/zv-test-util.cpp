@@ -76,16 +76,6 @@ pid_t launch(const std::vector<std::string> &argv, const Env &env, const int (&f
     return pid;
 }
 
-// The wait status of a child that the main loop reaped; false when the loop has not reaped it.
-bool reaped_status(pid_t pid, int *status)
-{
-    auto it = reaped_by_loop().find(pid);
-    if (it == reaped_by_loop().end())
-        return false;
-    *status = it->second;
-    return true;
-}
-
 } // namespace
 
 TempDir::TempDir(bool set_env)
@@ -227,8 +217,13 @@ bool Child::running()
     pid_t got = waitpid(pid_, &status, WNOHANG);
     if (got == 0 || (got < 0 && errno != ECHILD))
         return true;
-    if (got < 0 && !reaped_status(pid_, &status)) // reaped by the main loop: not yet heard of
-        return true;
+    if (got < 0) {
+        // Reaped by the main loop, which keeps its status: until its event is read, it runs.
+        auto reaped = reaped_by_loop().find(pid_);
+        if (reaped == reaped_by_loop().end())
+            return true;
+        status = reaped->second;
+    }
     status_ = status;
     exited_ = true;
     return false;
