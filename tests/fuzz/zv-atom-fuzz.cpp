@@ -36,7 +36,8 @@ std::string find_text(xmlDoc *doc, const std::string &name)
     xmlXPathContext *context = xmlXPathNewContext(doc);
     const std::string path = "string(//*[local-name()='" + name + "'])";
     xmlXPathObject *text = xmlXPathEvalExpression(BAD_CAST path.c_str(), context);
-    std::string found = text && text->stringval ? reinterpret_cast<const char *>(text->stringval) : "";
+    std::string found =
+        text && text->stringval ? reinterpret_cast<const char *>(text->stringval) : "";
     xmlXPathFreeObject(text);
     xmlXPathFreeContext(context);
     return found;

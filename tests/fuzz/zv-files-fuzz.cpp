@@ -2,8 +2,8 @@
 // file, with arbitrary content. A value read from an entry is its content less one
 // trailing newline.
 #include <glib.h>
-#include <notification.h>
 #include <key_storage.h>
+#include <notification.h>
 #include <stdint.h>
 #include <stdlib.h>
 

@@ -94,11 +94,11 @@ TEST(DesktopNotification, ShownReplacedClickedAndClosed)
         char self[PATH_MAX] = {};
         ASSERT_GT(readlink("/proc/self/exe", self, sizeof self - 1), 0);
         std::string out;
-        EXPECT_EQ(zv_test::run_program({"/usr/bin/dbus-run-session", "--", "/usr/bin/env",
-                                        "ZV_PRIVATE_BUS=1", self,
-                                        "--gtest_filter=DesktopNotification.*"},
-                                       "", &out),
-                  0)
+        EXPECT_EQ(
+            zv_test::run_program({"/usr/bin/dbus-run-session", "--", "/usr/bin/env",
+                                  "ZV_PRIVATE_BUS=1", self, "--gtest_filter=DesktopNotification.*"},
+                                 "", &out),
+            0)
             << out;
         return;
     }

@@ -10,15 +10,16 @@
 #include <mutex>
 #include <optional>
 #include <regex>
-#include <tuple>
 #include <string>
+#include <tuple>
 #include <vector>
 
 #include "zv-plugin-main.h"
 #include "zv-plugin-xml.h"
 #include "zv-test-server.h"
 
-namespace {
+namespace
+{
 
 const char TOKEN[] = "access-token-1";
 const char API_KEY[] = "api-key-1";
@@ -68,8 +69,9 @@ struct Handle {
     ~Handle() { zv_request_free(h); }
 };
 
-class ClientTest : public ::testing::Test {
-protected:
+class ClientTest : public ::testing::Test
+{
+  protected:
     // The server takes the token and the API key of the tests, and serves the account
     // requests on https.
     void SetUp() override
@@ -339,8 +341,8 @@ TEST_F(ClientTest, MetaUploadSendsHeadersAndEntryInOrderAndFailsOnOtherAnswers)
         Handle meta(&inbox_);
         set_meta(meta, long_token.c_str()); // refused
         EXPECT_EQ(send(zv_request_meta_upload, meta),
-                  (Answer{ZV_ERROR_HTTP, host == server_.host() ? 401 : 0,
-                          ZV_RESP_TYPE_META_UPLOAD, std::nullopt}));
+                  (Answer{ZV_ERROR_HTTP, host == server_.host() ? 401 : 0, ZV_RESP_TYPE_META_UPLOAD,
+                          std::nullopt}));
     }
     // The header line is cut at 511 characters.
     EXPECT_EQ(server_.requests().back().header("Authorization"),
@@ -369,7 +371,7 @@ TEST_F(ClientTest, DataUploadCutThenResumedBehindTheStatusQuery)
     ASSERT_EQ(r.size(), 5u);
     EXPECT_EQ(done, (Answer{0, 201, data, " \"" + id + "\""}));
     EXPECT_EQ(head(r[3]), "Host: HOST\nUser-Agent: UA\nAccept-Encoding: gzip,deflate\n"
-                                "Content-Range: bytes */*\nContent-Length: 0\n");
+                          "Content-Range: bytes */*\nContent-Length: 0\n");
     // The header lines of a data upload.
     auto put = [](const std::string &type, const std::string &range, const std::string &length) {
         return OPENING + "Content-Type: " + type + "\nContent-Range: bytes " + range +
@@ -453,7 +455,7 @@ TEST_F(ClientTest, CategoryLabelsInDocumentOrderWithLanguageFallback)
         ASSERT_TRUE(server_.clear_faults());
         gchar *body = g_uri_escape_string(c.doc, nullptr, false);
         ASSERT_TRUE(server_.add_fault(std::string("kind=category&action=status&times=0&status=") +
-                                       c.status + "&body=" + body));
+                                      c.status + "&body=" + body));
         g_free(body);
         EXPECT_EQ(labels("de"), c.expected) << c.doc;
     }

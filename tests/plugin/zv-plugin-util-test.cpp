@@ -39,7 +39,10 @@ TEST(PluginUtil, MediaTypeFileNameSizeIdAndTheValuesCutOutOfAnswers)
         EXPECT_EQ(text(zv_plugin_util_get_file_mime(path)), text(type)) << text(path);
 
     for (auto [path, name] : {std::make_pair<const char *, const char *>("/a/b/c.mp4", "c.mp4"),
-                              {"c.mp4", "c.mp4"}, {"/a/b/", ""}, {"/", ""}, {NULL, NULL}}) {
+                              {"c.mp4", "c.mp4"},
+                              {"/a/b/", ""},
+                              {"/", ""},
+                              {NULL, NULL}}) {
         gchar *got = zv_plugin_util_get_file_name(path);
         EXPECT_EQ(text(got), text(name)) << text(path);
         g_free(got);

@@ -215,20 +215,32 @@ long long DevServer::fired(const std::string &action) const
     return total;
 }
 
-std::vector<Upload> DevServer::uploads() const
+namespace {
+
+// The uploads of an admin answer (a list, or one upload alone).
+std::vector<Upload> uploads_in(const std::string &body)
 {
     std::vector<Upload> list;
-    for (const std::string &o : json_objects(http("GET", url("/_admin/uploads")).body))
+    for (const std::string &o : json_objects(body))
         list.push_back({json_get(o, "id"), json_get(o, "url"), json_get(o, "path"),
                         json_number(o, "total"), json_number(o, "held"),
                         json_get(o, "complete") == "true"});
     return list;
 }
 
-Upload DevServer::upload_of_url(const std::string &url) const
+} // namespace
+
+std::vector<Upload> DevServer::uploads() const
 {
-    for (const Upload &u : uploads())
-        if (!url.empty() && u.url == url)
+    return uploads_in(http("GET", url("/_admin/uploads")).body);
+}
+
+// The upload's id ends its address; the server reads (and hashes) that one copy alone.
+Upload DevServer::upload_of_url(const std::string &upload_url) const
+{
+    const std::string id = upload_url.substr(upload_url.rfind('/') + 1);
+    for (const Upload &u : uploads_in(http("GET", url("/_admin/uploads/" + id)).body))
+        if (!upload_url.empty() && u.url == upload_url)
             return u;
     return Upload();
 }

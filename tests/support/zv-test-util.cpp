@@ -198,9 +198,9 @@ bool Child::start(const std::vector<std::string> &argv, const std::string &out_p
 {
     reaped_by_loop();
     killed_ = false;
-    int in = open("/dev/null", O_RDONLY | O_CLOEXEC),
-        out = out_path.empty() ? -1
-                               : open(out_path.c_str(), O_WRONLY | O_CREAT | O_APPEND | O_CLOEXEC, 0600);
+    int in = open("/dev/null", O_RDONLY | O_CLOEXEC), out = -1;
+    if (!out_path.empty())
+        out = open(out_path.c_str(), O_WRONLY | O_CREAT | O_APPEND | O_CLOEXEC, 0600);
     pid_ = launch(argv, env, {in, out, out}, nofile);
     close(in);
     if (out >= 0)

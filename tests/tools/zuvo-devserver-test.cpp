@@ -9,7 +9,8 @@
 
 #include "zv-test-server.h"
 
-namespace {
+namespace
+{
 
 using zv_test::http;
 using zv_test::Reply;
