@@ -58,17 +58,6 @@ std::string batch(const AppData &ad)
     return out.str();
 }
 
-// The popups of the window's canvas.
-std::vector<Evas_Object *> popups(Evas_Object *win)
-{
-    std::vector<Evas_Object *> found;
-    for (Evas_Object *o = evas_object_bottom_get(evas_object_evas_get(win)); o;
-         o = evas_object_above_get(o))
-        if (elm_object_widget_check(o) && !strcmp(elm_object_widget_type_get(o), "Elm_Popup"))
-            found.push_back(o);
-    return found;
-}
-
 } // namespace
 
 // All or nothing: a request that lacks a required extra logs why and keeps the batch. The
@@ -160,8 +149,8 @@ TEST(UploadMainApp, CreateBuildsTheWindowStackAndTerminateTakesItDown)
     }
     EXPECT_FALSE(elm_win_iconified_get(ad.win));
     EXPECT_FALSE(elm_config_access_get());
-    ASSERT_EQ(popups(ad.win).size(), 1u);
-    EXPECT_STREQ(elm_object_text_get(popups(ad.win)[0]),
+    ASSERT_EQ(widgets(ad.win, "Elm_Popup").size(), 1u);
+    EXPECT_STREQ(elm_object_text_get(widgets(ad.win, "Elm_Popup")[0]),
                  "The screen reader has been turned off while you use ZuVo uploads.");
     ASSERT_NE(ad.key_down_handler, nullptr);
     auto press = [] {
@@ -196,6 +185,6 @@ TEST(UploadMainApp, CreateBuildsTheWindowStackAndTerminateTakesItDown)
     EXPECT_TRUE(process_log.logged("[ERR] color table create fail"));
     EXPECT_TRUE(process_log.logged("[ERR] font table create fail"));
     EXPECT_EQ(ad.color_table, nullptr);
-    EXPECT_TRUE(popups(ad.win).empty());
+    EXPECT_TRUE(widgets(ad.win, "Elm_Popup").empty());
     _app_terminate(&ad);
 }

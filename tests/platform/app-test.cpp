@@ -56,7 +56,7 @@ long count_of(const std::string &path, const std::string &line)
 } // namespace
 
 // The codec's round trip runs across processes in the instance test and the companion's
-// launch test; here, what it must refuse. A missing key answers no value.
+// launch test; here, what it must refuse.
 TEST(LaunchMessage, BadMessagesAreRefused)
 {
     app_control_h h = nullptr;
@@ -91,32 +91,23 @@ TEST(LaunchMessage, BadMessagesAreRefused)
 
     app_control_add_extra_data(h, "big", std::string(ZV_APP_LAUNCH_MAX_MESSAGE, 'x').c_str());
     EXPECT_EQ(zv_app_launch_message_encode(h, &size), nullptr);
-    char *value = reinterpret_cast<char *>(1);
-    EXPECT_EQ(app_control_get_extra_data(h, "missing", &value), APP_CONTROL_ERROR_KEY_NOT_FOUND);
-    EXPECT_EQ(value, nullptr);
     app_control_destroy(h);
 }
 
+// Run from the build tree without ZV_RES_DIR (as the demo runs it), the resources are the
+// build tree's; a runtime folder that is a file is refused (the instance test sees it made
+// private).
 TEST(AppPaths, ResourcePathAndRuntimeDir)
 {
     const std::string saved = getenv("ZV_RES_DIR") ? getenv("ZV_RES_DIR") : "";
-    char *cwd = g_get_current_dir();
-    const std::pair<const char *, std::string> cases[] = {
-        {"rel/res", std::string(cwd) + "/rel/res/"},
-        {nullptr, ZV_BUILD_RES_DIR}, // tests run from the build tree's bin folder
-    };
-    g_free(cwd);
-    for (const auto &c : cases) {
-        c.first ? setenv("ZV_RES_DIR", c.first, 1) : unsetenv("ZV_RES_DIR");
-        char *res = app_get_resource_path(), *shared = app_get_shared_resource_path();
-        EXPECT_STREQ(res, c.second.c_str());
-        EXPECT_STREQ(shared, c.second.c_str());
-        free(res);
-        free(shared);
-    }
-    saved.empty() ? unsetenv("ZV_RES_DIR") : setenv("ZV_RES_DIR", saved.c_str(), 1);
-
-    // A runtime folder that is a file is refused (the instance test sees it made private).
+    unsetenv("ZV_RES_DIR");
+    char *res = app_get_resource_path(), *shared = app_get_shared_resource_path();
+    if (!saved.empty())
+        setenv("ZV_RES_DIR", saved.c_str(), 1);
+    EXPECT_STREQ(res, ZV_BUILD_RES_DIR);
+    EXPECT_STREQ(shared, ZV_BUILD_RES_DIR);
+    free(res);
+    free(shared);
     TempDir tmp;
     write_file(tmp.file("file"), "x");
     setenv("ZV_RUNTIME_DIR", tmp.file("file").c_str(), 1);
@@ -138,12 +129,9 @@ TEST(AppInstanceTest, WrongCallsFailedCreateAndLaterLaunchesReachingTheInstance)
     const std::string probe = bin_path("zv-app-probe"), probe_log = tmp.file("probe.log");
     const std::string sock = tmp.file("run/zuvo-upload-svc.sock");
     setenv("ZV_PROBE_LOG", probe_log.c_str(), 1);
-    for (std::string args : {"--extra", "--extra novalue", "--extra =value", "--bogus", "extra"}) {
-        std::string out, cmd = probe + " " + args + " 2>&1";
-        EXPECT_EQ(run_program({"/bin/sh", "-c", cmd}, "", &out), 2) << args;
-        EXPECT_EQ(std::count(out.begin(), out.end(), '\n'), 1) << out;
-    }
-    EXPECT_EQ(run_program({probe, "--help"}), 0);
+    EXPECT_EQ(
+        wrong_calls(probe, {"--extra", "--extra novalue", "--extra =value", "--bogus", "extra"}),
+        "");
 
     Child failed;
     ASSERT_TRUE(failed.start({probe, "--extra", "A=1"}, "", {{"ZV_PROBE_FAIL_CREATE", "1"}}));
@@ -166,8 +154,7 @@ TEST(AppInstanceTest, WrongCallsFailedCreateAndLaterLaunchesReachingTheInstance)
     EXPECT_EQ(run_program({probe, "--extra", "C=vidéo ✓", "--extra", "E=5"}), 0);
     EXPECT_TRUE(wait_for([&] { return count_of(probe_log, "app_control C=vidéo ✓ E=5") == 1; }));
 
-    // A malformed message is answered with a refusal; a request for another application
-    // finds none.
+    // A malformed message is answered with a refusal.
     int fd = socket(AF_UNIX, SOCK_STREAM, 0);
     sockaddr_un addr = {};
     addr.sun_family = AF_UNIX;
@@ -179,12 +166,6 @@ TEST(AppInstanceTest, WrongCallsFailedCreateAndLaterLaunchesReachingTheInstance)
     EXPECT_EQ(read(fd, &reply, 1), 1);
     EXPECT_EQ(reply, 'R');
     close(fd);
-    app_control_h h = nullptr;
-    app_control_create(&h);
-    app_control_set_app_id(h, "other-app");
-    EXPECT_EQ(app_control_send_launch_request(h, nullptr, nullptr),
-              APP_CONTROL_ERROR_APP_NOT_FOUND);
-    app_control_destroy(h);
 
     EXPECT_EQ(run_program({probe, "--extra", "PROBE_ICONIFY=1"}), 0);
     ASSERT_TRUE(wait_for([&] { return count_of(probe_log, "pause") == 1; }));

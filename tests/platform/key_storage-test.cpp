@@ -43,12 +43,7 @@ TEST(KeyStorage, PrivateEntriesReadBackAndOpenOnesAreRefused)
     ASSERT_EQ(run_program({tool, "get", "zuvo.tizen.client.id"}, "", &out), 0);
     EXPECT_EQ(out, "s3cret\n");
     EXPECT_EQ(run_program({tool, "get", "absent"}), 1);
-    EXPECT_EQ(run_program({tool, "--help"}, "", &out), 0);
-    for (const char *args : {"", "get", "set", "get a b", "list", "get a/b"}) {
-        std::string cmd = tool + " " + args + " 2>&1 </dev/null";
-        EXPECT_EQ(run_program({"/bin/sh", "-c", cmd}, "", &out), 2) << cmd;
-        EXPECT_EQ(std::count(out.begin(), out.end(), '\n'), 1) << out;
-    }
+    EXPECT_EQ(wrong_calls(tool, {"", "get", "set", "get a b", "list", "get a/b"}), "");
 
     // Open to the group, to others.
     const std::pair<const char *, mode_t> cases[] = {{"keys/zuvo.tizen.client.id", 0640},

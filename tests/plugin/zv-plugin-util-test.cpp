@@ -25,10 +25,6 @@ TEST(PluginUtil, MediaTypeFileNameSizeIdAndTheValuesCutOutOfAnswers)
     // clang-format off
     const std::pair<const char *, const char *> types[] = { // NULL type: unknown
         {"/media/DCIM/Clip.MP4", "video/mp4"}, {"/media/a.JPEG", "image/jpeg"},
-        {"a.jpg", "image/jpeg"}, {"x.png", "image/png"}, {"x.BMP", "image/bmp"},
-        {"x.gif", "image/gif"}, {"x.tiff", "image/tiff"}, {"x.wmv", "video/x-ms-wmv"},
-        {"x.mp3", "audio/mp3"}, {"x.3GP", "video/3gp"}, {"x.avi", "video/x-msvideo"},
-        {"x.doc", "application/msword"}, {"x.pdf", "application/pdf"}, {"x.txt", "text/plain"},
         {"/media/clip.tar.zip", "application/zip"}, // only the last dot counts
         {"/media/clip", NULL}, {"/media/clip.mov", NULL}, {"x.tif", NULL}, {"x.jpe", NULL},
         {"x.mkv", NULL}, {"x.mp4 ", NULL}, {"/dir.old/clip", NULL}, {"/dir.mp4/clip", NULL},
@@ -38,11 +34,9 @@ TEST(PluginUtil, MediaTypeFileNameSizeIdAndTheValuesCutOutOfAnswers)
     for (auto [path, type] : types)
         EXPECT_EQ(text(zv_plugin_util_get_file_mime(path)), text(type)) << text(path);
 
-    for (auto [path, name] : {std::make_pair<const char *, const char *>("/a/b/c.mp4", "c.mp4"),
-                              {"c.mp4", "c.mp4"},
-                              {"/a/b/", ""},
-                              {"/", ""},
-                              {NULL, NULL}}) {
+    const std::pair<const char *, const char *> names[] = {
+        {"/a/b/c.mp4", "c.mp4"}, {"c.mp4", "c.mp4"}, {"/a/b/", ""}, {"/", ""}, {NULL, NULL}};
+    for (auto [path, name] : names) {
         gchar *got = zv_plugin_util_get_file_name(path);
         EXPECT_EQ(text(got), text(name)) << text(path);
         g_free(got);

@@ -87,7 +87,7 @@ Reply http(const std::string &method, const std::string &url,
     }
     if (method != "GET")
         curl_easy_setopt(c, CURLOPT_CUSTOMREQUEST, method.c_str());
-    r.code = curl_easy_perform(c);
+    curl_easy_perform(c);
     curl_easy_getinfo(c, CURLINFO_RESPONSE_CODE, &r.status);
     curl_slist_free_all(list);
     curl_easy_cleanup(c);
@@ -215,33 +215,14 @@ long long DevServer::fired(const std::string &action) const
     return total;
 }
 
-namespace {
-
-// The uploads of an admin answer (a list, or one upload alone).
-std::vector<Upload> uploads_in(const std::string &body)
-{
-    std::vector<Upload> list;
-    for (const std::string &o : json_objects(body))
-        list.push_back({json_get(o, "id"), json_get(o, "url"), json_get(o, "path"),
-                        json_number(o, "total"), json_number(o, "held"),
-                        json_get(o, "complete") == "true"});
-    return list;
-}
-
-} // namespace
-
-std::vector<Upload> DevServer::uploads() const
-{
-    return uploads_in(http("GET", url("/_admin/uploads")).body);
-}
-
 // The upload's id ends its address; the server reads (and hashes) that one copy alone.
 Upload DevServer::upload_of_url(const std::string &upload_url) const
 {
     const std::string id = upload_url.substr(upload_url.rfind('/') + 1);
-    for (const Upload &u : uploads_in(http("GET", url("/_admin/uploads/" + id)).body))
-        if (!upload_url.empty() && u.url == upload_url)
-            return u;
+    for (const std::string &o : json_objects(http("GET", url("/_admin/uploads/" + id)).body))
+        if (!upload_url.empty() && json_get(o, "url") == upload_url)
+            return {id, upload_url, json_get(o, "path"), json_number(o, "total"),
+                    json_number(o, "held"), json_get(o, "complete") == "true"};
     return Upload();
 }
 

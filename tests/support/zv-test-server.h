@@ -17,7 +17,6 @@ using Headers = std::vector<std::pair<std::string, std::string>>;
 // One HTTP exchange (no proxy, 60 s at most); a POST, a PUT or a request with a body sends
 // body with its Content-Length. Response headers as received.
 struct Reply {
-    int code = 0; // the CURLcode
     long status = 0;
     std::string headers, body;
     // The value of the first header line "name: value" (exact case), "" when absent.
@@ -90,7 +89,6 @@ public:
     bool clear_faults() const { return http("DELETE", url("/_admin/faults")).status == 200; }
     // How many requests the rules with this action acted on.
     long long fired(const std::string &action) const;
-    std::vector<Upload> uploads() const;
     Upload upload_of_url(const std::string &url) const;
 
 private:

@@ -5,6 +5,7 @@
 #include <sys/socket.h>
 
 #include <Ecore.h>
+#include <Elementary.h>
 #include <errno.h>
 #include <fcntl.h>
 #include <signal.h>
@@ -137,6 +138,17 @@ bool wait_for(const std::function<bool()> &pred, int timeout_ms, bool *quit_by_o
     return w.held;
 }
 
+std::vector<Evas_Object *> widgets(Evas_Object *win, const char *type)
+{
+    std::vector<Evas_Object *> found;
+    for (Evas_Object *o = evas_object_bottom_get(evas_object_evas_get(win)); o;
+         o = evas_object_above_get(o))
+        if (elm_object_widget_check(o) && evas_object_visible_get(o) &&
+            !strcmp(elm_object_widget_type_get(o), type))
+            found.push_back(o);
+    return found;
+}
+
 std::string bin_path(const std::string &program)
 {
     const char *dir = getenv("ZV_BIN_DIR");
@@ -183,6 +195,18 @@ int run_program(const std::vector<std::string> &argv, const std::string &input, 
     if (out)
         *out = collected;
     return WIFEXITED(status) ? WEXITSTATUS(status) : -1;
+}
+
+std::string wrong_calls(const std::string &program, const std::vector<std::string> &calls)
+{
+    std::string failed = run_program({program, "--help"}) == 0 ? "" : "--help failed\n", out;
+    for (const std::string &args : calls) {
+        const std::string cmd = program + " " + args + " 2>&1 </dev/null";
+        int status = run_program({"/bin/sh", "-c", cmd}, "", &out);
+        if (status != 2 || std::count(out.begin(), out.end(), '\n') != 1)
+            failed += "'" + args + "': status " + std::to_string(status) + ", " + out + "\n";
+    }
+    return failed;
 }
 
 Child::~Child()

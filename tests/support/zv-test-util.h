@@ -2,6 +2,7 @@
 // into it, waiting on the main loop for a condition, running programs of the build.
 #pragma once
 
+#include <Evas.h>
 #include <sys/resource.h>
 #include <sys/types.h>
 
@@ -36,6 +37,9 @@ private:
 bool wait_for(const std::function<bool()> &pred, int timeout_ms = 5000,
               bool *quit_by_other = nullptr);
 
+// The visible widgets of this type (as "Elm_Popup") at the top of the window's canvas.
+std::vector<Evas_Object *> widgets(Evas_Object *win, const char *type);
+
 // Path of a program built into the build tree's bin folder.
 std::string bin_path(const std::string &program);
 // Path below the source tree.
@@ -51,6 +55,11 @@ pid_t spawn_piped(const std::vector<std::string> &argv, int *input, int *output)
 // status (or -1) and collects standard output into *out when given.
 int run_program(const std::vector<std::string> &argv, const std::string &input = "",
                 std::string *out = nullptr);
+
+// Runs each call (the program's arguments, split at blanks) with its output and error
+// together: "" when each exits with 2 having written one line, as a wrong call must, and
+// --help exits with 0; else what went otherwise.
+std::string wrong_calls(const std::string &program, const std::vector<std::string> &calls);
 
 // A listening TCP socket on 127.0.0.1 with a port of the system's choosing; -1 on failure.
 // *port receives the port.

@@ -26,18 +26,14 @@ TEST(DevServerTest, WrongCallsKeysRangesAndFaultsSetByAdminRequest)
 {
     zv_test::TempDir dir(false);
     const std::string bin = zv_test::bin_path("zuvo-devserver");
-    const std::vector<std::vector<std::string>> calls = {
-        {bin},                                                             // no --storage
-        {bin, "--storage", dir.path(), "--bogus"},                         // unknown option
-        {bin, "--storage", dir.path(), "--port", "70000"},                 // port out of range
-        {bin, "--storage", dir.path(), "--port"},                          // missing value
-        {bin, "--storage", dir.path(), "--tls-cert", "x.pem"},             // https without a key
-        {bin, "--storage", dir.path(), "extra"},                           // stray argument
-        {bin, "--storage", dir.path(), "--fault", "kind=data,action=fly"}, // unknown fault action
-    };
-    for (const auto &argv : calls)
-        EXPECT_EQ(zv_test::run_program(argv), 2) << argv.back();
-    EXPECT_EQ(zv_test::run_program({bin, "--help"}), 0);
+    const std::string storage = "--storage " + dir.path() + " ";
+    // No storage, an unknown option, a port out of range, a missing value, https without a key,
+    // a stray argument, an unknown fault action.
+    EXPECT_EQ(
+        zv_test::wrong_calls(bin, {"", storage + "--bogus", storage + "--port 70000",
+                                   storage + "--port", storage + "--tls-cert x.pem",
+                                   storage + "extra", storage + "--fault kind=data,action=fly"}),
+        "");
 
     zv_test::DevServer server;
     ASSERT_TRUE(server.start(dir.path(), {"--token", "T1", "--api-key", "K1"}));

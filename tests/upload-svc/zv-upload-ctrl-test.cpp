@@ -131,8 +131,8 @@ TEST_F(UploadCtrlTest, NotificationsFollowTheCounters)
     }
 }
 
-// Rows whose file cannot be sent, rows that cannot be sent at all, and answers that name no
-// byte of the file.
+// Rows whose file cannot be sent, rows that cannot be sent at all, answers that name no byte
+// of the file, and requests that fail at once.
 TEST_F(UploadCtrlTest, RowsThatCannotBeSentEndPausedAndSayWhy)
 {
     ASSERT_EQ(unlink(dir_.file("keys/zuvo.tizen.api.key").c_str()), 0); // no key, no key folder
@@ -187,6 +187,29 @@ TEST_F(UploadCtrlTest, RowsThatCannotBeSentEndPausedAndSayWhy)
                                       range + "\""));
         EXPECT_EQ(job(11)->handle->resp_type, ZV_RESP_TYPE_UPLOAD_QUERY) << "no data upload";
     }
+
+    // Upload again against a closed port: each status query is refused at once, however
+    // soon after it was queued, and its job ends PAUSED with nothing in flight.
+    std::vector<int> ids = {21, 22, 23, 24, 25, 26, 27, 28};
+    for (int id : ids)
+        ASSERT_TRUE(add_row(id, ZV_UPLOAD_STATUS_PAUSED, id, good.c_str(), "Clip",
+                            "http://127.0.0.1:9/upload/1"));
+    zv_upload_list_load_full_item(&ad_);
+    for (int id : ids)
+        ad_.resume_upload(&ad_, job(id));
+    ASSERT_TRUE(jobs_are(ids, ZV_UPLOAD_STATUS_PAUSED));
+
+    // With the engine stopped, every request is refused when it is made.
+    ASSERT_EQ(run_program({bin_path("zv-keystore"), "set", "zuvo.tizen.api.key"}, "dev-key"), 0);
+    zv_finalize_service();
+    ASSERT_TRUE(add_row(30, ZV_UPLOAD_STATUS_READY, 30, good.c_str()));
+    g_test_log.mark();
+    launch();
+    ASSERT_TRUE(rows_are({30}, ZV_UPLOAD_STATUS_PAUSED));
+    EXPECT_TRUE(g_test_log.logged("zv_request_meta_upload fail: -998"));
+    ad_.resume_upload(&ad_, job(21));
+    EXPECT_TRUE(g_test_log.logged("zv_request_upload_query fail: -998"));
+    EXPECT_EQ(job(21)->status, ZV_UPLOAD_STATUS_PAUSED);
 }
 
 TEST_F(UploadCtrlTest, PauseBeforeTheUploadMessageHoldsAndUploadsAndCompletionsAreTakenOnce)
@@ -281,32 +304,6 @@ TEST_F(UploadCtrlTest, PauseBeforeTheUploadMessageHoldsAndUploadsAndCompletionsA
         EXPECT_EQ(j->handle, handle);
         EXPECT_TRUE(jobs_are({id}, ZV_UPLOAD_STATUS_COMPLETED, 0));
     }
-}
-
-TEST_F(UploadCtrlTest, RequestsThatFailAtOnceLeaveTheirJobsPaused)
-{
-    // Upload again against a closed port: each status query is refused at once, however
-    // soon after it was queued, and its job ends PAUSED with nothing in flight.
-    std::vector<int> ids = {1, 2, 3, 4, 5, 6, 7, 8};
-    for (int id : ids)
-        ASSERT_TRUE(add_row(id, ZV_UPLOAD_STATUS_PAUSED, id,
-                            video("v" + std::to_string(id) + ".mp4", 100).c_str(), "Clip",
-                            "http://127.0.0.1:9/upload/1"));
-    start_controller();
-    for (int id : ids)
-        ad_.resume_upload(&ad_, job(id));
-    ASSERT_TRUE(jobs_are(ids, ZV_UPLOAD_STATUS_PAUSED));
-
-    // With the engine stopped, every request is refused when it is made.
-    zv_finalize_service();
-    ASSERT_TRUE(add_row(20, ZV_UPLOAD_STATUS_READY, 20, video("late.mp4", 100).c_str()));
-    g_test_log.mark();
-    launch();
-    ASSERT_TRUE(rows_are({20}, ZV_UPLOAD_STATUS_PAUSED));
-    EXPECT_TRUE(g_test_log.logged("zv_request_meta_upload fail: -998"));
-    ad_.resume_upload(&ad_, job(1));
-    EXPECT_TRUE(g_test_log.logged("zv_request_upload_query fail: -998"));
-    EXPECT_EQ(job(1)->status, ZV_UPLOAD_STATUS_PAUSED);
 }
 
 TEST_F(UploadCtrlTest, StoresThatFailAreMadeAgainAndARowIsOneJob)
