@@ -12,10 +12,7 @@ namespace
 {
 
 // A text to compare and print, NULL as "NULL".
-std::string text(const char *s)
-{
-    return s ? s : "NULL";
-}
+auto text = [](const char *s) { return std::string(s ? s : "NULL"); };
 
 // The size past 4 GiB and that of a missing file go through the data upload (client tests).
 TEST(PluginUtil, MediaTypeFileNameSizeIdAndTheValuesCutOutOfAnswers)
