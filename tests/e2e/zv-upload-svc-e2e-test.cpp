@@ -131,8 +131,8 @@ TEST_F(ServiceE2ETest, KilledMidUploadResumesWithStatusQueryAtNextStart)
         {std::string("kind=data,action=throttle,rate=") + (large ? "134217728" : "300000")}));
     int id = record({file}, "Long").at(0);
     Child &first = start_service();
-    // The server's copy is watched on disk: its listing hashes every copy, too slow to poll
-    // across the kill point.
+    // The server's copy is watched on disk: the server hashes the copy it is asked about, too
+    // slow to poll across the kill point.
     std::string copy;
     ASSERT_TRUE(wait_for([&] { return !(copy = upload_of(id).path).empty(); }, kLongWaitMs));
     struct stat st = {};

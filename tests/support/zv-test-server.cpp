@@ -215,12 +215,15 @@ long long DevServer::fired(const std::string &action) const
     return total;
 }
 
-// The upload's id ends its address; the server reads (and hashes) that one copy alone.
+// The upload's id ends its address; the server reads (and hashes) that one copy alone. No
+// address (a row not sent yet) asks nothing.
 Upload DevServer::upload_of_url(const std::string &upload_url) const
 {
+    if (upload_url.empty())
+        return Upload();
     const std::string id = upload_url.substr(upload_url.rfind('/') + 1);
     for (const std::string &o : json_objects(http("GET", url("/_admin/uploads/" + id)).body))
-        if (!upload_url.empty() && json_get(o, "url") == upload_url)
+        if (json_get(o, "url") == upload_url)
             return {id, upload_url, json_get(o, "path"), json_number(o, "total"),
                     json_number(o, "held"), json_get(o, "complete") == "true"};
     return Upload();

@@ -28,11 +28,11 @@ inline AppData &process_appdata()
 inline bool add_row(int historyid, int status, double date, const char *filename,
                     const char *title = "Clip", const char *url = nullptr, int percent = 0)
 {
-    auto text = [](const char *s) { return const_cast<char *>(s); };
-    DbItem row = {historyid,   text("user@example.com"),
-                  text(title), text(filename),
-                  10,          percent,
-                  text(url),   status,
+    auto chars = [](const char *s) { return const_cast<char *>(s); };
+    DbItem row = {historyid,    chars("user@example.com"),
+                  chars(title), chars(filename),
+                  10,           percent,
+                  chars(url),   status,
                   date};
     return zv_ext_db_insert_item(&row) == 1;
 }
